@@ -1,0 +1,1 @@
+// Intentionally empty: lets a folder library exist before it has sources.
