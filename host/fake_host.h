@@ -187,9 +187,15 @@ class FakeHost {
   void handleStdin(const ko::ipc::PacketHeader& header, const std::string& payload) REQUIRES(mu_);
   void queueFinish(uint32_t id, const ChildScript& script) REQUIRES(mu_);
   void queuePacket(uint32_t type, uint32_t id, uint32_t value, const std::string& payload) REQUIRES(mu_);
+  void queueDelivery(std::string packet) REQUIRES(mu_);
   void queueTask(std::function<void()> task) REQUIRES(mu_);
   void runnerLoop();
   void noteChange() REQUIRES(mu_);
+  // `changed_` is bound to `mu_`, which the analysis cannot see through.
+  void waitChange() const REQUIRES(mu_) NO_THREAD_SAFETY_ANALYSIS { changed_.wait(); }
+  bool waitChangeUntil(CondVar::Clock::time_point deadline) const REQUIRES(mu_) NO_THREAD_SAFETY_ANALYSIS {
+    return changed_.waitUntil(deadline);
+  }
 
   mutable Mutex mu_;
   mutable CondVar changed_{&mu_};
