@@ -10,6 +10,7 @@
 #include "Sorvik/plugin/module.h"
 #include "Sorvik/plugin/status_codes.h"
 #include "Sorvik/plugin/xml_envelope.h"
+#include "Sorvik/service/status_documents.h"
 #include "Sorvik/service/update_service.h"
 
 namespace sorvik {
@@ -135,19 +136,7 @@ void UpdateService::processConfiguration(const unsigned char* data, size_t lengt
 
   if (requested == current) {
     log(kLogProgress, "Ignoring request to change state %d, current state=%d", requested, current);
-    TimeStamp when;
-    int32_t state = 0;
-    {
-      MutexLock lock(&stateMutex);
-      if (FailoverReport.Time == 0) {
-        const TimeStamp now = stampTime();
-        FailoverReport.Time = now.seconds;
-        FailoverReport.Milliseconds = now.milliseconds;
-      }
-      when = {FailoverReport.Time, FailoverReport.Milliseconds};
-      state = FailoverReport.FailoverState;
-    }
-    emitFailoverStatus(state, when);
+    emitFailoverReportUnchanged(*this);
     return;
   }
 
@@ -172,13 +161,7 @@ void UpdateService::processConfiguration(const unsigned char* data, size_t lengt
       log(kLogProgress, "Failover State transition from %s (%d) to %s (%d)", statusCodeName(current), current,
           statusCodeName(requested), requested);
       emitState();
-      const TimeStamp now = stampTime();
-      {
-        MutexLock lock(&stateMutex);
-        FailoverReport.Time = now.seconds;
-        FailoverReport.Milliseconds = now.milliseconds;
-      }
-      emitFailoverStatus(requested, now);
+      emitFailoverReportRestamped(*this);
       return;
     }
     case config_refuse:
