@@ -35,7 +35,7 @@ tsan: deps
 
 bench: deps
 	$(CMAKE_GEN) -S . -B build-release -DCMAKE_BUILD_TYPE=Release -DSORVIK_BUILD_TESTS=OFF \
-	  -DCMAKE_C_COMPILER=clang -DCMAKE_CXX_COMPILER=clang++
+	  -DCMAKE_C_COMPILER=gcc -DCMAKE_CXX_COMPILER=g++
 	cmake --build build-release -j $(JOBS)
 	bash tools/run-benchmarks.sh build-release
 

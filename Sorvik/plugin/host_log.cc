@@ -16,14 +16,9 @@ int32_t sendLine(uint32_t moduleId, HostCallback callback, int32_t level, const 
   return callback(line.bytes, 0);
 }
 
-}  // namespace
-
-int32_t hostLogV(uint32_t moduleId, HostCallback callback, int32_t level, const char* format, va_list args) {
-  if (callback == nullptr || format == nullptr) return 0;
-  HostMessage query = HostMessage::make(moduleId, kTargetLog, kTypeLogLevelQuery, nullptr, 0);
-  const int32_t threshold = callback(query.bytes, 0);
-  if (level < threshold) return 0;
-
+// Kept out of line so that a line the host drops costs only the query.
+__attribute__((noinline)) int32_t formatAndSend(uint32_t moduleId, HostCallback callback, int32_t level,
+                                                const char* format, va_list args) {
   char buffer[kLineBuffer];
   va_list again;
   va_copy(again, args);
@@ -50,18 +45,34 @@ int32_t hostLogV(uint32_t moduleId, HostCallback callback, int32_t level, const 
   return sendLine(moduleId, callback, level, heap.get(), static_cast<size_t>(m));
 }
 
+}  // namespace
+
+// The threshold is asked for on every line, before any formatting.
+inline bool hostWants(uint32_t moduleId, HostCallback callback, int32_t level) {
+  HostMessage query = HostMessage::make(moduleId, kTargetLog, kTypeLogLevelQuery, nullptr, 0);
+  return level >= callback(query.bytes, 0);
+}
+
+int32_t hostLogV(uint32_t moduleId, HostCallback callback, int32_t level, const char* format, va_list args) {
+  if (callback == nullptr || format == nullptr || !hostWants(moduleId, callback, level)) return 0;
+  return formatAndSend(moduleId, callback, level, format, args);
+}
+
 int32_t hostLog(uint32_t moduleId, HostCallback callback, int32_t level, const char* format, ...) {
+  if (callback == nullptr || format == nullptr || !hostWants(moduleId, callback, level)) return 0;
   va_list args;
   va_start(args, format);
-  const int32_t result = hostLogV(moduleId, callback, level, format, args);
+  const int32_t result = formatAndSend(moduleId, callback, level, format, args);
   va_end(args);
   return result;
 }
 
 void log(int32_t level, const char* format, ...) {
+  const HostCallback callback = hostCallback();
+  if (callback == nullptr || format == nullptr || !hostWants(kModuleId, callback, level)) return;
   va_list args;
   va_start(args, format);
-  hostLogV(kModuleId, hostCallback(), level, format, args);
+  formatAndSend(kModuleId, callback, level, format, args);
   va_end(args);
 }
 
