@@ -9,6 +9,7 @@
 // line, a document send, file I/O or a wait for a child. Members without the
 // mark are touched by the worker thread only, or are fixed after construction.
 
+#include <chrono>
 #include <cstdint>
 #include <memory>
 #include <string>
@@ -22,6 +23,10 @@
 namespace sorvik {
 
 class WorkerSteps;
+class WorkerWait;
+
+// Where the state survives restarts, relative to the host's current directory.
+inline constexpr const char kStateFileName[] = "update.xml";
 
 enum WorkerAction : int32_t {
   action_none = 0,
@@ -80,6 +85,7 @@ class UpdateService {
 
   // Intake from host threads.
   void processCommand(const unsigned char* data, size_t length);
+  void processAgentCommand(const TiXmlElement& element);
   void processConfiguration(const unsigned char* data, size_t length);
 
   // Persisted state and status documents.
@@ -92,6 +98,22 @@ class UpdateService {
   void emitSpareResetStatus(int32_t status);
 
   bool isKnownPlatform(const std::string& name) const;
+
+  // The worker's wake test: an update is pending, an action was posted, or
+  // the worker is asked to stop.
+  bool workerShouldWake() REQUIRES(stateMutex) {
+    return !Location.empty() || postedAction != action_none || !workerRunning;
+  }
+  // Sleeps on wakeCondition, which is bound to stateMutex (the analysis
+  // cannot see that binding). False once `deadline` has passed.
+  bool waitForWakeUntil(CondVar::Clock::time_point deadline) REQUIRES(stateMutex) NO_THREAD_SAFETY_ANALYSIS {
+    return wakeCondition.waitUntil(deadline);
+  }
+  void waitForWake() REQUIRES(stateMutex) NO_THREAD_SAFETY_ANALYSIS { wakeCondition.wait(); }
+  // Replaces how the worker sleeps between passes (nullptr: the steady
+  // clock). Tests use it to fire time-outs without waiting; set it before
+  // runWorker starts.
+  void setWorkerWaitForTesting(WorkerWait* wait);
 
   // Convenience readers that take stateMutex briefly.
   bool isWorkerRunning();
@@ -124,6 +146,7 @@ class UpdateService {
   void loadPersistedState(TiXmlDocument& doc);
 
   WorkerSteps* const steps_;
+  WorkerWait* wait_;
 };
 
 // The long-running steps the worker carries out, implemented by the update

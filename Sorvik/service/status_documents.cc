@@ -1,0 +1,210 @@
+#include "Sorvik/service/status_documents.h"
+
+#include <chrono>
+#include <ctime>
+#include <string>
+
+#include "Sorvik/plugin/host_log.h"
+#include "Sorvik/plugin/module.h"
+#include "Sorvik/plugin/status_codes.h"
+#include "Sorvik/plugin/xml_envelope.h"
+#include "Sorvik/service/state_file.h"
+
+namespace sorvik {
+namespace {
+
+using ko::core::kLogProgress;
+using ko::core::log;
+
+// Unsigned fields (times, ports) must not wrap to negative text.
+void setUnsigned(TiXmlElement* element, const char* name, uint32_t value) {
+  element->SetAttribute(name, std::to_string(value));
+}
+
+void sendStatus(const TiXmlDocument& doc) {
+  ko::core::sendXmlToHost(ko::core::kTargetStatus, ko::core::printCompact(doc));
+}
+
+}  // namespace
+
+TimeStamp stampTime() {
+  // 100 ns ticks since 1970, the resolution the host's time stamps assume.
+  const auto since = std::chrono::system_clock::now().time_since_epoch();
+  const int64_t ticks = std::chrono::duration_cast<std::chrono::nanoseconds>(since).count() / 100;
+  const int64_t seconds = ticks / 10000000;
+  TimeStamp stamp;
+  stamp.seconds = static_cast<uint32_t>(seconds);
+  stamp.milliseconds = static_cast<uint32_t>((ticks - seconds * 10000000) / 10000);
+  return stamp;
+}
+
+void buildFailoverStatusDocument(TiXmlDocument& doc, int32_t code, TimeStamp when) {
+  TiXmlElement* update = ko::core::buildEnvelope(doc, false);
+  update->SetAttribute("FailoverStatus", code);
+  setUnsigned(update, "Time", when.seconds);
+  setUnsigned(update, "Milliseconds", when.milliseconds);
+}
+
+void buildFailbackStatusDocument(TiXmlDocument& doc, int32_t status, TimeStamp when, uint32_t port) {
+  TiXmlElement* update = ko::core::buildEnvelope(doc, true);
+  update->SetAttribute("FailbackStatus", status);
+  if (status == ko::core::AGENT_READY) setUnsigned(update, "Port", port);
+  setUnsigned(update, "Time", when.seconds);
+  setUnsigned(update, "Milliseconds", when.milliseconds);
+}
+
+void buildSpareResetStatusDocument(TiXmlDocument& doc, int32_t status, TimeStamp when) {
+  TiXmlElement* update = ko::core::buildEnvelope(doc, true);
+  update->SetAttribute("SpareResetStatus", status);
+  setUnsigned(update, "Time", when.seconds);
+  setUnsigned(update, "Milliseconds", when.milliseconds);
+}
+
+void UpdateService::buildStateDocument(TiXmlDocument& doc, bool statusForm) {
+  bool hasFailover = false;
+  int32_t failoverState = 0;
+  int32_t failoverStatus = 0;
+  std::string downloadDir;
+  int32_t timeout = 0;
+  int32_t status = 0;
+  int32_t progress = 0;
+  uint32_t time = 0;
+  {
+    MutexLock lock(&stateMutex);
+    hasFailover = HasFailover;
+    failoverState = FailoverReport.FailoverState;
+    failoverStatus = FailoverReport.FailoverStatus;
+    downloadDir = DownloadDir;
+    timeout = Timeout;
+    status = Status;
+    progress = Progress;
+    time = Time;
+  }
+  if (statusForm) {
+    TiXmlElement* update = ko::core::buildEnvelope(doc, false);
+    update->SetAttribute("Status", status);
+    if (status == ko::core::BUNDLE_DOWNLOAD) update->SetAttribute("Progress", progress);
+    update->SetAttribute("FailoverStatus", failoverStatus);
+    setUnsigned(update, "Time", time);
+    return;
+  }
+  TiXmlElement* update = ko::core::buildEnvelope(doc, true);
+  update->SetAttribute("HasFailover", hasFailover ? 1 : 0);
+  if (hasFailover) update->SetAttribute("FailoverState", failoverState);
+  update->SetAttribute("HasFailback", hasFailover ? 1 : 0);
+  update->SetAttribute("DownloadDir", downloadDir);
+  update->SetAttribute("Timeout", timeout);
+  if (status == ko::core::PENDING_UPDATE) {
+    update->SetAttribute("PendingUpdate", "1");
+  } else if (failoverStatus == ko::core::DECOMMISSION_PENDING) {
+    update->SetAttribute("PendingFailover", failoverStatus);
+  }
+}
+
+void UpdateService::emitState() {
+  TiXmlDocument doc;
+  buildStateDocument(doc, false);
+  std::string error;
+  if (!saveDocument(doc, kStateFileName, &error)) {
+    log(ko::core::kLogStepFailed, "Could not save %s: %s", kStateFileName, error.c_str());
+  }
+  std::string packageType;
+  {
+    MutexLock lock(&stateMutex);
+    packageType = PackageType;
+  }
+  if (TiXmlElement* update = doc.RootElement() ? doc.RootElement()->FirstChildElement("Update") : nullptr) {
+    update->SetAttribute("PackageType", packageType);
+  }
+  ko::core::sendXmlToHost(ko::core::kTargetState, ko::core::printCompact(doc));
+}
+
+void UpdateService::emitUpdateStatus(int32_t code) {
+  {
+    MutexLock lock(&stateMutex);
+    Status = code;
+    Time = static_cast<uint32_t>(std::time(nullptr));
+  }
+  log(kLogProgress, "Emit update status: (%s)", ko::core::statusCodeName(code));
+  TiXmlDocument doc;
+  buildStateDocument(doc, true);
+  sendStatus(doc);
+}
+
+void UpdateService::emitFailoverStatus(int32_t code, TimeStamp when) {
+  TiXmlDocument doc;
+  buildFailoverStatusDocument(doc, code, when);
+  log(kLogProgress, "Emit failover status: %s (%d)", ko::core::statusCodeName(code), code);
+  sendStatus(doc);
+}
+
+void UpdateService::emitFailbackStatus(int32_t status, TimeStamp when, uint32_t port) {
+  TiXmlDocument doc;
+  buildFailbackStatusDocument(doc, status, when, port);
+  log(kLogProgress, "Emit Failback status: %s (%d)", ko::core::agentStatusName(status), status);
+  sendStatus(doc);
+}
+
+void UpdateService::emitSpareResetStatus(int32_t status) {
+  TiXmlDocument doc;
+  buildSpareResetStatusDocument(doc, status, stampTime());
+  log(kLogProgress, "Emit Spare Reset status: %s (%d)", ko::core::agentStatusName(status), status);
+  sendStatus(doc);
+}
+
+void emitFailbackReport(UpdateService& service, uint32_t port) {
+  FailbackReportRecord report;
+  {
+    // A Time of 0 means "never stamped"; never store it as a real stamp.
+    TimeStamp now = stampTime();
+    if (now.seconds == 0) now = stampTime();
+    MutexLock lock(&service.stateMutex);
+    service.FailbackReport.Time = now.seconds;
+    service.FailbackReport.Milliseconds = now.milliseconds;
+    service.FailbackReport.Port = port;
+    report = service.FailbackReport;
+  }
+  service.emitFailbackStatus(report.FailbackStatus, TimeStamp{report.Time, report.Milliseconds}, report.Port);
+}
+
+void emitFailbackReportUnchanged(UpdateService& service) {
+  FailbackReportRecord report;
+  {
+    const TimeStamp now = stampTime();
+    MutexLock lock(&service.stateMutex);
+    if (service.FailbackReport.Time == 0) {
+      service.FailbackReport.Time = now.seconds;
+      service.FailbackReport.Milliseconds = now.milliseconds;
+    }
+    report = service.FailbackReport;
+  }
+  service.emitFailbackStatus(report.FailbackStatus, TimeStamp{report.Time, report.Milliseconds}, report.Port);
+}
+
+void emitFailoverReportRestamped(UpdateService& service) {
+  FailoverReportRecord report;
+  {
+    const TimeStamp now = stampTime();
+    MutexLock lock(&service.stateMutex);
+    service.FailoverReport.Time = now.seconds;
+    service.FailoverReport.Milliseconds = now.milliseconds;
+    report = service.FailoverReport;
+  }
+  service.emitFailoverStatus(report.FailoverState, TimeStamp{report.Time, report.Milliseconds});
+}
+
+void emitFailoverReportUnchanged(UpdateService& service) {
+  FailoverReportRecord report;
+  {
+    const TimeStamp now = stampTime();
+    MutexLock lock(&service.stateMutex);
+    if (service.FailoverReport.Time == 0) {
+      service.FailoverReport.Time = now.seconds;
+      service.FailoverReport.Milliseconds = now.milliseconds;
+    }
+    report = service.FailoverReport;
+  }
+  service.emitFailoverStatus(report.FailoverState, TimeStamp{report.Time, report.Milliseconds});
+}
+
+}  // namespace sorvik
