@@ -66,6 +66,8 @@ std::vector<unsigned char> writeRecord(const void* data, uint32_t length) {
 class EntryPointsTest : public ::testing::Test {
  protected:
   void SetUp() override {
+    // Close stops agents by name; this run's name matches no real agent.
+    ::setenv("SORVIK_AGENT_IMAGE_NAME", ("kelp-entry-test-" + std::to_string(::getpid())).c_str(), 1);
     dir_ = std::filesystem::temp_directory_path() /
            ("sorvik-entry-" + std::to_string(::getpid()) + "-" +
             ::testing::UnitTest::GetInstance()->current_test_info()->name());

@@ -111,7 +111,12 @@ class PosixPlatform final : public Platform {
     return ::kill(static_cast<pid_t>(pid), static_cast<int>(exitCode)) == 0;
   }
 
-  std::string agentImageName() override { return "kelp"; }
+  // SORVIK_AGENT_IMAGE_NAME lets a test run give its agent a name of its own,
+  // so that stopping agents by name never reaches another run's agent.
+  std::string agentImageName() override {
+    const char* name = std::getenv("SORVIK_AGENT_IMAGE_NAME");
+    return name != nullptr && *name != '\0' ? name : "kelp";
+  }
 };
 
 }  // namespace
