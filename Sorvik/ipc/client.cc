@@ -95,10 +95,7 @@ bool client::read_line(std::string& out, int stream, int64_t timeout_ms) {
   bool haveDeadline = false;
   sorvik::CondVar::Clock::time_point deadline;
   while (true) {
-    if (buffer.takeUntil('\n', &out)) {
-      if (!out.empty() && out.back() == '\r') out.pop_back();
-      return true;
-    }
+    if (buffer.takeUntil('\n', &out, /*dropCarriageReturnBefore=*/true)) return true;
     if (in.state != ClientState::Running) {
       if (buffer.empty()) return false;
       buffer.takeAll(&out);

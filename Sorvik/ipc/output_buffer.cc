@@ -5,13 +5,6 @@
 
 namespace ko::ipc {
 
-namespace {
-
-// Compaction moves the remaining bytes; below this the move is not worth it.
-constexpr size_t kCompactMinimum = 64 * 1024;
-
-}  // namespace
-
 size_t OutputBuffer::append(const char* bytes, size_t length, bool dropCarriageReturns) {
   if (length == 0) return 0;
   if (!dropCarriageReturns) {
@@ -34,25 +27,6 @@ size_t OutputBuffer::append(const char* bytes, size_t length, bool dropCarriageR
   }
   compactIfWorthwhile();
   return dropped;
-}
-
-bool OutputBuffer::takeUntil(char delimiter, std::string* out) {
-  if (searchedFor_ != delimiter) {
-    searchedFor_ = delimiter;
-    searched_ = start_;
-  }
-  const size_t from = std::max(searched_, start_);
-  const void* hit = std::memchr(data_.data() + from, delimiter, data_.size() - from);
-  if (hit == nullptr) {
-    searched_ = data_.size();
-    return false;
-  }
-  const size_t pos = static_cast<size_t>(static_cast<const char*>(hit) - data_.data());
-  out->assign(data_, start_, pos - start_);
-  start_ = pos + 1;
-  searched_ = start_;
-  compactIfWorthwhile();
-  return true;
 }
 
 void OutputBuffer::takeAll(std::string* out) {

@@ -10,6 +10,7 @@
 // Not thread-safe; the owning client's mutex guards it.
 
 #include <cstddef>
+#include <cstring>
 #include <string>
 
 namespace ko::ipc {
@@ -17,6 +18,8 @@ namespace ko::ipc {
 class OutputBuffer {
  public:
   static constexpr size_t kDefaultLimit = size_t{1} << 20;
+  // Compaction moves the remaining bytes; below this the move is not worth it.
+  static constexpr size_t kCompactMinimum = 64 * 1024;
 
   explicit OutputBuffer(size_t limit = kDefaultLimit) : limit_(limit) {}
 
@@ -25,8 +28,29 @@ class OutputBuffer {
   size_t append(const char* bytes, size_t length, bool dropCarriageReturns);
 
   // When the unread bytes contain `delimiter`: sets `out` to the bytes before
-  // it, consumes them and the delimiter, returns true. Else leaves `out`.
-  bool takeUntil(char delimiter, std::string* out);
+  // it (less one carriage return right before it when asked), consumes them
+  // and the delimiter, returns true. Else leaves `out`.
+  // Inline: a reader draining short lines calls it once per line.
+  bool takeUntil(char delimiter, std::string* out, bool dropCarriageReturnBefore = false) {
+    if (searchedFor_ != delimiter) {
+      searchedFor_ = delimiter;
+      searched_ = start_;
+    }
+    const size_t from = searched_ > start_ ? searched_ : start_;
+    const void* hit = std::memchr(data_.data() + from, delimiter, data_.size() - from);
+    if (hit == nullptr) {
+      searched_ = data_.size();
+      return false;
+    }
+    const size_t pos = static_cast<size_t>(static_cast<const char*>(hit) - data_.data());
+    size_t length = pos - start_;
+    if (dropCarriageReturnBefore && length > 0 && data_[pos - 1] == '\r') --length;
+    out->assign(data_.data() + start_, length);
+    start_ = pos + 1;
+    searched_ = start_;
+    if (start_ >= kCompactMinimum || start_ == data_.size()) compactIfWorthwhile();
+    return true;
+  }
 
   // Moves every unread byte into `out`.
   void takeAll(std::string* out);
