@@ -15,6 +15,11 @@
 #include "Sorvik/plugin/xml_envelope.h"
 #include "Sorvik/service/update_service.h"
 
+// The build sets the version of each plug-in library it makes.
+#ifndef SORVIK_MODULE_VERSION
+#error "SORVIK_MODULE_VERSION must be defined"
+#endif
+
 namespace {
 
 using ko::core::kLogInternal;
@@ -61,7 +66,7 @@ SORVIK_EXPORT int32_t Load(void* parmsIn, void* parmsOut) {
 }
 
 SORVIK_EXPORT int32_t Open() {
-  return guarded("Open", [] { ko::core::announceModule(); });
+  return guarded("Open", [] { ko::core::announceModule(SORVIK_MODULE_VERSION); });
 }
 
 SORVIK_EXPORT int32_t IOCTL(void* record) {

@@ -6,7 +6,6 @@
 
 #include "Sorvik/plugin/host_callback.h"
 #include "Sorvik/plugin/module.h"
-#include "Sorvik/plugin/module_version.h"
 
 namespace ko::core {
 namespace {
@@ -144,7 +143,7 @@ bool parseHostDocument(const unsigned char* data, size_t length, TiXmlDocument* 
   return !doc->Error();
 }
 
-std::string announcementText() {
+std::string announcementText(const char* version) {
   TiXmlDocument doc;
   TiXmlElement* root = addRoot(doc, true);
   auto* modules = new TiXmlElement("Modules");
@@ -152,11 +151,11 @@ std::string announcementText() {
   auto* module = new TiXmlElement("Module");
   module->SetAttribute("Name", kModuleName);
   module->SetAttribute("ID", static_cast<int>(kModuleId));
-  module->SetAttribute("Version", kModuleVersion);
+  module->SetAttribute("Version", version);
   modules->LinkEndChild(module);
   return printCompact(doc);
 }
 
-void announceModule() { sendXmlToHost(kTargetState, announcementText()); }
+void announceModule(const char* version) { sendXmlToHost(kTargetState, announcementText(version)); }
 
 }  // namespace ko::core

@@ -35,7 +35,8 @@ bool nestsDeeperThan(const char* text, size_t length, int maxDepth);
 // parse or nests deeper than 100 levels.
 bool parseHostDocument(const unsigned char* data, size_t length, TiXmlDocument* doc);
 
-std::string announcementText();
-void announceModule();
+// The module announcement for this build's four-part version.
+std::string announcementText(const char* version);
+void announceModule(const char* version);
 
 }  // namespace ko::core

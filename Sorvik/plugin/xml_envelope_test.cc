@@ -2,15 +2,14 @@
 
 #include <gtest/gtest.h>
 
-#include "Sorvik/plugin/module_version.h"
 
 namespace ko::core {
 namespace {
 
 TEST(XmlEnvelopeTest, AnnouncementIsExact) {
-  EXPECT_EQ(announcementText(), std::string("<?xml ?><Qora Delta=\"0\"><Modules><Module Name=\"Sorvik\" "
-                                            "ID=\"3670016\" Version=\"") +
-                                    kModuleVersion + "\" /></Modules></Qora>");
+  EXPECT_EQ(announcementText("1.2.3.4"),
+            "<?xml ?><Qora Delta=\"0\"><Modules><Module Name=\"Sorvik\" ID=\"3670016\" Version=\"1.2.3.4\" "
+            "/></Modules></Qora>");
 }
 
 TEST(XmlEnvelopeTest, CompactAndPrettyPrinting) {
