@@ -52,12 +52,16 @@ TEST(UtcTimestampTest, AgreesWithGmtimeAndStaysMonotonic) {
       // Fixed-width text: lexical order is time order.
       ASSERT_LT(previous, text) << s;
       previous = text;
-      if (s >= 0) ASSERT_EQ(text, viaGmtime(static_cast<int32_t>(s))) << s;
+      if (s >= 0) {
+        ASSERT_EQ(text, viaGmtime(static_cast<int32_t>(s))) << s;
+      }
     }
   }
   for (int i = 0; i < 200000; ++i) {
     const int32_t s = any(random);
-    if (s >= 0) ASSERT_EQ(format_utc_timestamp(s), viaGmtime(s)) << s;
+    if (s >= 0) {
+      ASSERT_EQ(format_utc_timestamp(s), viaGmtime(s)) << s;
+    }
   }
 }
 
