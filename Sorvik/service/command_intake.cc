@@ -104,6 +104,12 @@ void UpdateService::processAgentCommand(const TiXmlElement& element) {
     if (!readIntAttribute(&element, "FailoverStart", &request.FailoverStart) || request.FailoverStart == 0) return;
     if (!readIntAttribute(&element, "FailoverEnd", &request.FailoverEnd) || request.FailoverEnd == 0) return;
     if (const char* token = element.Attribute("PasswordToken")) request.PasswordToken = token;
+    // The token travels to the agent as one line of its standard input; a
+    // line break would let the sender feed the agent further lines.
+    if (request.PasswordToken.find_first_of("\r\n") != std::string::npos) {
+      log(kLogRejected, "PasswordToken for %s contains a line break; request ignored", workerActionName(action));
+      return;
+    }
     if (request.PasswordToken.empty()) {
       if (action == action_start_agent) {
         log(kLogRejected, "PasswordToken is needed for command to %s", workerActionName(action));

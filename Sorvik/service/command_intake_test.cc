@@ -172,6 +172,12 @@ TEST_F(CommandIntakeTest, AcceptedStartsCarryTheirRequest) {
   EXPECT_EQ(request().Port, 7066u);
   EXPECT_TRUE(host_.hasLog("Agent port -1 out of range, using 7066"));
 
+  // A token is one line of the agent's input; it cannot smuggle in more.
+  clearPosted();
+  sendAgent("FailbackAgentRun=\"1\" FailoverStart=\"1\" FailoverEnd=\"2\" PasswordToken=\"tok-1&#10;-delete\"");
+  EXPECT_EQ(posted(), action_none);
+  EXPECT_TRUE(host_.hasLog("PasswordToken for start_agent contains a line break; request ignored"));
+
   for (const auto& record : host_.logs()) EXPECT_EQ(record.text.find("tok-1"), std::string::npos);
 }
 

@@ -30,7 +30,8 @@ void sendStatus(const TiXmlDocument& doc) {
 TimeStamp stampTime() {
   // 100 ns ticks since 1970, the resolution the host's time stamps assume.
   const auto since = std::chrono::system_clock::now().time_since_epoch();
-  const int64_t ticks = std::chrono::duration_cast<std::chrono::nanoseconds>(since).count() / 100;
+  int64_t ticks = std::chrono::duration_cast<std::chrono::nanoseconds>(since).count() / 100;
+  if (ticks < 0) ticks = 0;  // a clock set before 1970
   const int64_t seconds = ticks / 10000000;
   TimeStamp stamp;
   stamp.seconds = static_cast<uint32_t>(seconds);

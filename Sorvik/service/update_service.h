@@ -147,6 +147,8 @@ class UpdateService {
 
   WorkerSteps* const steps_;
   WorkerWait* wait_;
+  // True while some thread is inside runWorker: there is only ever one worker.
+  bool workerActive_ GUARDED_BY(stateMutex) = false;
 };
 
 // The long-running steps the worker carries out, implemented by the update

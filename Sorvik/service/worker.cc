@@ -280,8 +280,20 @@ void Worker::shutDown() {
 }
 
 void UpdateService::runWorker() {
+  bool alreadyActive = false;
+  {
+    MutexLock lock(&stateMutex);
+    alreadyActive = std::exchange(workerActive_, true);
+  }
+  if (alreadyActive) {
+    // A second worker would race the first over the agent and the steps.
+    log(kLogInternal, "Worker thread is already running; second start ignored");
+    return;
+  }
   Worker worker(*this, stepsOrNone(steps_), *wait_);
   worker.run();
+  MutexLock lock(&stateMutex);
+  workerActive_ = false;
 }
 
 void UpdateService::requestStop() {

@@ -345,6 +345,14 @@ TEST_F(WorkerTest, StopRequestEndsWorkerAndDropsPendingUpdate) {
   EXPECT_TRUE(service_.Location.empty());
 }
 
+TEST_F(WorkerTest, SecondWorkerIsRefusedWhileOneRuns) {
+  startWorker();
+  service_.runWorker();  // returns at once instead of racing the first
+  EXPECT_TRUE(host_.hasLog("Worker thread is already running; second start ignored"));
+  post(action_stop_agent);  // the first one still serves
+  EXPECT_EQ(steps_.calls(), std::vector<std::string>{"StopAgent null 15"});
+}
+
 TEST(WorkerRealClockTest, CloseWhileWaitingReturnsPromptly) {
   testing::ScopedTempCwd cwd;
   InstalledHost host;
