@@ -122,7 +122,9 @@ TEST_F(WorkerTest, StartUpReportsEverythingInOrder) {
       "Emit Spare Reset status: NONE (200)"};
   EXPECT_EQ(logTexts(host_), expected);
   for (const auto& record : host_.logs()) {
-    if (record.text.rfind("  ", 0) == 0 || record.text == "Update failed:") EXPECT_EQ(record.level, 75);
+    if (record.text.rfind("  ", 0) == 0 || record.text == "Update failed:") {
+      EXPECT_EQ(record.level, 75);
+    }
   }
   {
     MutexLock lock(&service.stateMutex);
