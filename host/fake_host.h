@@ -104,6 +104,9 @@ struct ChildScript {
   static ChildScript neverAnswers();
 };
 
+// Thread-safe: every record, script and the runner's queue are guarded by
+// `mu_`; the runner thread calls the sink and stdin handlers with no lock
+// held, so a delivery may re-enter the callback.
 class FakeHost {
  public:
   // Where the runner's packets go; by default ko::ipc::receive.
