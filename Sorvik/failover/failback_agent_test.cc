@@ -18,7 +18,10 @@ constexpr char kAgent[] = "./kelp";
 constexpr char kToken[] = "Tq9-secret-4711";
 constexpr char kDrives[] = "C:\\\\,D:\\\\";
 constexpr auto kWait = std::chrono::seconds(10);
+// Long enough for a scripted answer on a loaded machine; only the silent
+// agent ever waits it out.
 constexpr auto kShortLimit = std::chrono::milliseconds(250);
+constexpr auto kAnswerLimit = std::chrono::seconds(3);
 
 AgentRequestRecord request() {
   AgentRequestRecord r;
@@ -72,15 +75,16 @@ TEST_F(FailbackAgentTest, AgentWithoutAUsablePortIsDroppedButNotKilled) {
   struct Case {
     const char* name;
     ChildScript script;
+    std::chrono::nanoseconds limit;
     const char* error;
   };
   const Case cases[] = {
-      {"silent", ChildScript::runsUntilTold(), "invalid stoi argument"},
-      {"exits early", ChildScript::exits(3), "invalid stoi argument"},
-      {"words first", agentPrinting("listening on 7123\n"), "invalid stoi argument"},
-      {"empty line", agentPrinting("\n"), "invalid stoi argument"},
-      {"too large", agentPrinting("99999999999\n"), "stoi argument out of range"},
-      {"not a port", agentPrinting("70000\n"), "port 70000 out of range"},
+      {"silent", ChildScript::runsUntilTold(), kShortLimit, "invalid stoi argument"},
+      {"exits early", ChildScript::exits(3), kAnswerLimit, "invalid stoi argument"},
+      {"words first", agentPrinting("listening on 7123\n"), kAnswerLimit, "invalid stoi argument"},
+      {"empty line", agentPrinting("\n"), kAnswerLimit, "invalid stoi argument"},
+      {"too large", agentPrinting("99999999999\n"), kAnswerLimit, "stoi argument out of range"},
+      {"not a port", agentPrinting("70000\n"), kAnswerLimit, "port 70000 out of range"},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
@@ -88,7 +92,7 @@ TEST_F(FailbackAgentTest, AgentWithoutAUsablePortIsDroppedButNotKilled) {
     host().setScript(kAgent, c.script);
     AgentRequestRecord r = request();
 
-    StartAgentWithPortLimit(service(), kDrives, r, kShortLimit);
+    StartAgentWithPortLimit(service(), kDrives, r, c.limit);
 
     const auto failures = logsWith("Failed to retrieve failback agent's port. Error: ");
     ASSERT_EQ(failures.size(), 1u);
