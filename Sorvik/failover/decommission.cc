@@ -12,7 +12,8 @@ namespace sorvik {
 namespace {
 
 constexpr char kFailoverScript[] = "scripts/failover.ps1";
-// Text A present but empty; the host must not close the script's input for us.
+// An empty leading text, and no close of the script's input at the first wait:
+// the script reads nothing, and the flags are part of the host contract.
 constexpr uint32_t kScriptFlags = ko::ipc::kSpawnNoAutoClose | ko::ipc::kSpawnTextA;
 
 void setFailoverStatus(UpdateService& service, int32_t status) {

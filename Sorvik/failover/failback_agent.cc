@@ -1,10 +1,8 @@
 #include "Sorvik/failover/failback_agent.h"
 
 #include <cctype>
-#include <cerrno>
 #include <climits>
 #include <cstring>
-#include <set>
 #include <vector>
 
 #include "Sorvik/platform/platform.h"
@@ -55,7 +53,8 @@ bool spawnAgent(UpdateService& service, const std::vector<std::string>& args) {
 }
 
 // The token goes to standard input only, never to the log or the command
-// line; the input stays open because the agent may read it again.
+// line. Sent as plain input without the close bit: the agent expects its
+// input to stay open.
 void sendToken(const ko::ipc::client& agent, const std::string& token) {
   std::string line = token;
   line += '\n';
