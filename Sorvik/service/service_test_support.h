@@ -5,8 +5,6 @@
 // worker wait whose time-outs the test fires, and a worker thread guarded by
 // a watchdog. Header-only; included by *_test.cc files only.
 
-#include <unistd.h>
-
 #include <chrono>
 #include <condition_variable>
 #include <cstdio>

@@ -61,6 +61,8 @@ FileInUse::FileInUse(const std::string& path) : path_(path) { FileInUseRegistry:
 FileInUse::~FileInUse() { FileInUseRegistry::instance().release(path_); }
 
 bool parseDocumentFile(TiXmlDocument& doc, const std::string& path) {
+  // Read first rather than TiXmlDocument::LoadFile: the nesting check must
+  // see the text before the parser does.
   doc.Clear();
   std::string bytes;
   if (!readWholeFile(path, &bytes)) {

@@ -120,14 +120,15 @@ TEST(StateFileTest, FailedWriteRemovesPendingFileAndKeepsOldState) {
   testing::ScopedTempCwd cwd;
   writeFile("update.xml", kOld);
   FaultyPlatform faulty;
-  faulty.writeError = "write error 28";
-
-  TiXmlDocument doc = documentWithTimeout("900");
-  std::string error;
-  EXPECT_FALSE(saveDocument(doc, "update.xml", &error));
-  EXPECT_EQ(error, "write error 28");
-  EXPECT_EQ(doc.ErrorId(), TiXmlBase::TIXML_ERROR_OPENING_FILE);
-  EXPECT_EQ(faulty.removals.load(), 1);
+  for (const char* text : {"create error 13", "write error 28", "close error 5", "only wrote 3 of 91 bytes"}) {
+    faulty.writeError = text;
+    TiXmlDocument doc = documentWithTimeout("900");
+    std::string error;
+    EXPECT_FALSE(saveDocument(doc, "update.xml", &error));
+    EXPECT_EQ(error, text);
+    EXPECT_EQ(doc.ErrorId(), TiXmlBase::TIXML_ERROR_OPENING_FILE);
+  }
+  EXPECT_EQ(faulty.removals.load(), 4);
   EXPECT_EQ(readFile("update.xml"), kOld);
 }
 

@@ -40,15 +40,6 @@ TEST(StatusDocumentsTest, FixedDocumentsHaveExactAttributeOrder) {
             "Milliseconds=\"999\" /></Qora>");
 }
 
-TEST(StatusDocumentsTest, StampTimeSplitsSecondsAndMilliseconds) {
-  const uint32_t before = static_cast<uint32_t>(std::time(nullptr));
-  const TimeStamp stamp = stampTime();
-  const uint32_t after = static_cast<uint32_t>(std::time(nullptr));
-  EXPECT_GE(stamp.seconds, before);
-  EXPECT_LE(stamp.seconds, after);
-  EXPECT_LT(stamp.milliseconds, 1000u);
-}
-
 class ServiceDocumentsTest : public ::testing::Test {
  protected:
   testing::ScopedTempCwd cwd_;

@@ -74,15 +74,6 @@ class WorkerTest : public ::testing::Test {
   std::unique_ptr<testing::WorkerThread> worker_;
 };
 
-TEST(SupervisionTimeoutTest, PeriodFollowsWhatIsSupervised) {
-  EXPECT_EQ(supervisionTimeout(action_none, 0), seconds(3420));
-  EXPECT_EQ(supervisionTimeout(action_start_agent, 0), seconds(30));
-  EXPECT_EQ(supervisionTimeout(action_start_reset, 0), seconds(1));
-  EXPECT_EQ(supervisionTimeout(action_stop_agent, 1), seconds(1));
-  EXPECT_EQ(supervisionTimeout(action_start_agent, 2), seconds(1));
-  EXPECT_EQ(supervisionTimeout(action_stop_agent, 0), seconds(3420));
-}
-
 TEST_F(WorkerTest, StartUpReportsEverythingInOrder) {
   // A restart after an install whose script logged a failure.
   writeFile("update.xml",
