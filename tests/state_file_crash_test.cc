@@ -51,11 +51,28 @@ std::string downloadDirOf(const TiXmlDocument& doc) {
   ::_exit(0);
 }
 
+// Runs the test in a fresh directory and removes it however the test ends.
+class ScratchDirectory {
+ public:
+  ScratchDirectory()
+      : previous_(boost::filesystem::current_path()),
+        dir_(boost::filesystem::temp_directory_path() / boost::filesystem::unique_path("sorvik-crash-%%%%-%%%%")) {
+    boost::filesystem::create_directories(dir_);
+    boost::filesystem::current_path(dir_);
+  }
+  ~ScratchDirectory() {
+    boost::system::error_code ignored;
+    boost::filesystem::current_path(previous_, ignored);
+    boost::filesystem::remove_all(dir_, ignored);
+  }
+
+ private:
+  const boost::filesystem::path previous_;
+  const boost::filesystem::path dir_;
+};
+
 TEST(StateFileCrashTest, KilledSaverNeverLeavesBrokenState) {
-  const auto dir = boost::filesystem::temp_directory_path() / boost::filesystem::unique_path("sorvik-crash-%%%%-%%%%");
-  boost::filesystem::create_directories(dir);
-  const auto previous = boost::filesystem::current_path();
-  boost::filesystem::current_path(dir);
+  ScratchDirectory scratch;
 
   const std::string expectedA(6000, 'a');
   const std::string expectedB(13000, 'b');
@@ -90,9 +107,6 @@ TEST(StateFileCrashTest, KilledSaverNeverLeavesBrokenState) {
   // Both documents must have been seen, or the kills never hit the saver's loop.
   EXPECT_GT(sawA, 0);
   EXPECT_GT(sawB, 0);
-
-  boost::filesystem::current_path(previous);
-  boost::filesystem::remove_all(dir);
 }
 
 }  // namespace
