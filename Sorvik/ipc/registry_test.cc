@@ -2,7 +2,10 @@
 
 #include <gtest/gtest.h>
 
+#include <set>
+#include <string>
 #include <thread>
+#include <vector>
 
 #include "Sorvik/ipc/client.h"
 #include "Sorvik/ipc/ipc_test_support.h"
@@ -155,6 +158,32 @@ TEST_F(RegistryTest, ShutdownEndsRunningAndPendingChildren) {
   // Reopened for the next case.
   shutdown(false);
   EXPECT_EQ(ClientState::Running, spawn({"./kelp"})->state());
+}
+
+TEST_F(RegistryTest, ConcurrentSpawnsAndDeliveriesStayConsistent) {
+  constexpr int kThreads = 4;
+  constexpr int kChildrenEach = 50;
+  std::vector<std::thread> threads;
+  std::vector<std::vector<uint32_t>> ids(kThreads);
+  for (int t = 0; t < kThreads; ++t) {
+    threads.emplace_back([this, t, &ids] {
+      for (int i = 0; i < kChildrenEach; ++i) {
+        auto child = spawn({"./kelp"});
+        ASSERT_EQ(ClientState::Running, child->state());
+        ids[t].push_back(child->id());
+        host_.deliver(makePacket(PacketType::StdoutData, child->id(), 0, "port " + std::to_string(i) + "\n"));
+        host_.deliver(makePacket(PacketType::Exited, child->id(), static_cast<uint32_t>(i)));
+        std::string line;
+        ASSERT_TRUE(child->read_line(line, 0, 60000));
+        EXPECT_EQ("port " + std::to_string(i), line);
+        EXPECT_EQ(i, child->wait());
+      }
+    });
+  }
+  for (std::thread& thread : threads) thread.join();
+  std::set<uint32_t> distinct;
+  for (const auto& list : ids) distinct.insert(list.begin(), list.end());
+  EXPECT_EQ(static_cast<size_t>(kThreads * kChildrenEach), distinct.size());
 }
 
 }  // namespace
