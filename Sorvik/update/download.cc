@@ -65,8 +65,9 @@ bool DownloadBundle(UpdateService& service, const std::string& location, std::st
     service.emitUpdateStatus(INVALID_URI_LOCATION);
     return false;
   }
-  log(kLogDetail, "scheme(%s) user:pass(%s:%s) host(%s) path(%s)", parsed.scheme.c_str(), parsed.user.c_str(),
-      parsed.password.empty() ? "" : "***", parsed.host.c_str(), parsed.path.c_str());
+  log(kLogDetail, "scheme(%s) user:pass(%s:%s) host(%s) path(%s)", parsed.scheme.c_str(),
+      redactUser(parsed.user).c_str(), parsed.password.empty() ? "" : "***", parsed.host.c_str(),
+      parsed.path.c_str());
   if (parsed.host.empty()) {
     log(kLogRejected, "No host name in URI.");
     service.emitUpdateStatus(INVALID_HOST_NAME);

@@ -1,5 +1,6 @@
 #include "Sorvik/update/location.h"
 
+#include <algorithm>
 #include <array>
 
 namespace sorvik {
@@ -87,32 +88,50 @@ bool parseLocation(std::string_view text, BundleLocation* out) {
 }
 
 std::string redactLocation(std::string_view text) {
+  // Two readings can disagree on where a password lies: the grammar's (which
+  // may find credentials inside the path) and a URL reader's (the authority
+  // part before the first '/'). Both are masked.
+  struct Range {
+    size_t begin = npos;
+    size_t end = npos;
+  };
+  Range byGrammar;
   BundleLocation parsed;
-  size_t maskBegin = npos;
-  size_t maskEnd = npos;
   if (parseLocation(text, &parsed) && parsed.hasCredentials()) {
-    maskBegin = parsed.passwordBegin;
-    maskEnd = parsed.passwordEnd;
-  } else {
-    // What a URL reader would take as "user:password@" in the authority.
-    const size_t marker = text.find("://");
-    if (marker != npos) {
-      const size_t authorityBegin = marker + 3;
-      const size_t authorityEnd = std::min(text.find('/', authorityBegin), text.size());
-      const std::string_view authority = text.substr(authorityBegin, authorityEnd - authorityBegin);
-      const size_t atSign = authority.rfind('@');
-      const size_t colon = atSign == npos ? npos : authority.substr(0, atSign).find(':');
-      if (colon != npos && colon + 1 < atSign) {
-        maskBegin = authorityBegin + colon + 1;
-        maskEnd = authorityBegin + atSign;
-      }
-    }
+    byGrammar = {parsed.passwordBegin, parsed.passwordEnd};
   }
-  if (maskBegin == npos) return std::string(text);
-  std::string shown(text.substr(0, maskBegin));
-  shown += "***";
-  shown += text.substr(maskEnd);
+  Range byUrlReader;
+  const size_t marker = text.find("://");
+  if (marker != npos) {
+    const size_t authorityBegin = marker + 3;
+    const size_t authorityEnd = std::min(text.find('/', authorityBegin), text.size());
+    const std::string_view authority = text.substr(authorityBegin, authorityEnd - authorityBegin);
+    const size_t atSign = authority.rfind('@');
+    const size_t colon = atSign == npos ? npos : authority.substr(0, atSign).find(':');
+    if (colon != npos && colon + 1 < atSign) byUrlReader = {authorityBegin + colon + 1, authorityBegin + atSign};
+  }
+
+  Range first = byUrlReader.begin <= byGrammar.begin ? byUrlReader : byGrammar;
+  Range second = byUrlReader.begin <= byGrammar.begin ? byGrammar : byUrlReader;
+  if (second.begin != npos && second.begin <= first.end) {  // overlapping: one mask
+    first.end = std::max(first.end, second.end);
+    second = Range{};
+  }
+  std::string shown;
+  size_t copied = 0;
+  for (const Range& range : {first, second}) {
+    if (range.begin == npos) continue;
+    shown.append(text.substr(copied, range.begin - copied));
+    shown += "***";
+    copied = range.end;
+  }
+  shown.append(text.substr(copied));
   return shown;
+}
+
+std::string redactUser(const std::string& user) {
+  const size_t colon = user.find(':');
+  return colon == npos ? user : user.substr(0, colon + 1) + "***";
 }
 
 std::string locationWithoutCredentials(std::string_view text, const BundleLocation& parsed) {

@@ -35,10 +35,13 @@ struct BundleLocation {
 // False when `text` does not match the grammar; `out` is then unspecified.
 bool parseLocation(std::string_view text, BundleLocation* out);
 
-// `text` with any password it carries shown as "***". Uses the grammar's
-// reading when the text matches with credentials; otherwise masks what a URL
-// reader would take as the password of the authority part.
+// `text` with any password it carries shown as "***": the one the grammar
+// finds and the one a URL reader would find in the authority part.
 std::string redactLocation(std::string_view text);
+
+// A user as the grammar took it may hold a URL reader's "user:password@...";
+// everything after its first ':' is shown as "***".
+std::string redactUser(const std::string& user);
 
 // The URL to fetch: `text` without the "user:password@" the grammar found
 // (the credentials travel separately). Unchanged when there are none.

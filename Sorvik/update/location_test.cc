@@ -129,6 +129,13 @@ TEST(LocationTest, PasswordIsMaskedAndLeftOutOfTheUrl) {
   EXPECT_EQ(redactLocation("http://bob:pw@h"), "http://bob:***@h");
   // The port after the at sign is no password.
   EXPECT_EQ(redactLocation("http://bob@h:8080/f"), "http://bob@h:8080/f");
+  // The grammar takes "bob:pw@h/d" as the user and "x" as the password; a
+  // URL reader takes "pw" as the password. Neither is shown.
+  EXPECT_EQ(redactLocation("http://bob:pw@h/d:x@y/f"), "http://bob:***@h/d:***@y/f");
+  EXPECT_EQ(redactUser("bob:pw@h/d"), "bob:***");
+  EXPECT_EQ(redactUser("bob"), "bob");
+  // Both readings agree on a password holding an at sign.
+  EXPECT_EQ(redactLocation("ftp://a:p@q@h/f"), "ftp://a:***@h/f");
 
   BundleLocation loc;
   const std::string text = "https://bob:pw@updates.example/d/f.zip?x=1";
