@@ -34,10 +34,15 @@ def load(directory):
         with open(path) as f:
             data = json.load(f)
         for b in data.get("benchmarks", []):
-            if b.get("run_type", "iteration") != "iteration":
-                continue
-            name = b["name"].split("/real_time")[0].split("/process_time")[0].split("/iterations")[0]
-            results[name] = b
+            name = b.get("run_name", b["name"])
+            for suffix in ("/real_time", "/process_time", "/iterations", "/repeats", "/manual_time"):
+                name = name.split(suffix)[0]
+            # Repeated benchmarks are judged by their median.
+            if b.get("run_type") == "aggregate":
+                if b.get("aggregate_name") == "median":
+                    results[name] = b
+            elif results.get(name, {}).get("run_type") != "aggregate":
+                results[name] = b
     return results
 
 

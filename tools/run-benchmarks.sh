@@ -11,7 +11,7 @@ for bench in "$build"/bench/*_bench; do
   [ -x "$bench" ] || continue
   name=$(basename "$bench")
   echo "== $name"
-  "$bench" --benchmark_format=console --benchmark_out="$out/$name.json" --benchmark_out_format=json
+  "$bench" --benchmark_enable_random_interleaving=true --benchmark_format=console --benchmark_out="$out/$name.json" --benchmark_out_format=json
 done
 python3 "$root/tools/bench_report.py" "$out" > "$root/docs/benchmarks.md"
 cat "$root/docs/benchmarks.md"
