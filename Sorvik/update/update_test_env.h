@@ -1,10 +1,9 @@
 #pragma once
 
-// Shared setting for the update pipeline tests: a private working directory
-// (the service keeps "update.xml" there and the steps resolve "./data",
-// "logs/update.log" and the download directory against it), the fake host,
-// one service object with its worker marked as running, and a watchdog that
-// aborts a hung test. Test code only.
+// Setting for the update step tests: a private working directory (holding
+// "update.xml", "./data", "logs/update.log" and "downloads"), the fake host,
+// one service with its worker marked as running, and a watchdog that aborts
+// a hung test. Test code only.
 
 #include <tinyxml.h>
 #include <unistd.h>
@@ -28,20 +27,16 @@
 
 namespace sorvik::testing {
 
-// Aborts the process when a test is still running after `limit`, so that a
-// lost wake-up fails the run instead of hanging it.
 class UpdateWatchdog {
  public:
-  explicit UpdateWatchdog(std::chrono::seconds limit = std::chrono::seconds(30)) {
-    thread_ = std::thread([this, limit] {
-      std::unique_lock<std::mutex> lock(mu_);
-      if (!cv_.wait_for(lock, limit, [this] { return done_; })) {
-        const auto* info = ::testing::UnitTest::GetInstance()->current_test_info();
-        std::fprintf(stderr, "watchdog: %s hung\n", info != nullptr ? info->name() : "?");
-        std::abort();
-      }
-    });
-  }
+  explicit UpdateWatchdog(std::chrono::seconds limit = std::chrono::seconds(30))
+      : thread_([this, limit] {
+          std::unique_lock<std::mutex> lock(mu_);
+          if (!cv_.wait_for(lock, limit, [this] { return done_; })) {
+            std::fprintf(stderr, "watchdog: test hung\n");
+            std::abort();
+          }
+        }) {}
   ~UpdateWatchdog() {
     {
       std::lock_guard<std::mutex> lock(mu_);
@@ -56,11 +51,6 @@ class UpdateWatchdog {
   std::condition_variable cv_;
   bool done_ = false;
   std::thread thread_;
-};
-
-struct UpdateStatusReport {
-  int32_t status = 0;
-  int32_t progress = -1;  // -1: not in the document
 };
 
 class UpdateStepTest : public ::testing::Test {
@@ -89,58 +79,41 @@ class UpdateStepTest : public ::testing::Test {
   }
 
   static void writeFile(const boost::filesystem::path& path, const std::string& bytes) {
-    std::ofstream out(path.string(), std::ios::binary | std::ios::trunc);
-    out << bytes;
-    ASSERT_TRUE(out.good()) << path;
+    std::ofstream(path.string(), std::ios::binary | std::ios::trunc) << bytes;
   }
-
   static std::string readFile(const boost::filesystem::path& path) {
     std::ifstream in(path.string(), std::ios::binary);
     return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
   }
 
-  // Update status documents (target 4 with a Status attribute), in order.
-  std::vector<UpdateStatusReport> updateReports() const {
-    std::vector<UpdateStatusReport> reports;
+  // (Status, Progress) of each update status document, in order; Progress
+  // is -1 where the document has none.
+  std::vector<std::pair<int, int>> updateReports() const {
+    std::vector<std::pair<int, int>> reports;
     for (const DocumentRecord& doc : host_->documents()) {
-      if (doc.target != 4) continue;
       TiXmlDocument xml;
       xml.Parse(doc.text.c_str());
-      const TiXmlElement* root = xml.RootElement();
-      const TiXmlElement* update = root != nullptr ? root->FirstChildElement("Update") : nullptr;
-      UpdateStatusReport report;
-      if (update == nullptr || update->QueryIntAttribute("Status", &report.status) != TIXML_SUCCESS) continue;
-      update->QueryIntAttribute("Progress", &report.progress);
-      reports.push_back(report);
+      const TiXmlElement* update = xml.RootElement() ? xml.RootElement()->FirstChildElement("Update") : nullptr;
+      int status = 0;
+      int progress = -1;
+      if (doc.target != 4 || !update || update->QueryIntAttribute("Status", &status) != TIXML_SUCCESS) continue;
+      update->QueryIntAttribute("Progress", &progress);
+      reports.emplace_back(status, progress);
     }
     return reports;
   }
-
   std::vector<int32_t> statuses() const {
     std::vector<int32_t> codes;
-    for (const UpdateStatusReport& report : updateReports()) codes.push_back(report.status);
+    for (const auto& report : updateReports()) codes.push_back(report.first);
     return codes;
   }
 
-  // Log lines containing `text`.
   std::vector<LogRecord> logsWith(const std::string& text) const {
     std::vector<LogRecord> found;
     for (const LogRecord& record : host_->logs()) {
       if (record.text.find(text) != std::string::npos) found.push_back(record);
     }
     return found;
-  }
-
-  // Every byte that left the plug-in, apart from standard input of children
-  // (the one place credentials are meant to go): logs, documents, start requests.
-  std::string everythingShown() const {
-    std::string all;
-    for (const LogRecord& record : host_->logs()) all += record.text + "\n";
-    for (const DocumentRecord& doc : host_->documents()) all += doc.text + "\n";
-    for (const StartRecord& start : host_->starts()) {
-      for (const std::string& arg : start.args) all += arg + "\n";
-    }
-    return all;
   }
 
   UpdateService& service() { return *service_; }
