@@ -1,0 +1,33 @@
+#include "Sorvik/update/download_dir.h"
+
+#include <gtest/gtest.h>
+
+#include <boost/filesystem.hpp>
+
+#include "Sorvik/update/update_test_env.h"
+
+namespace sorvik {
+namespace {
+
+namespace fs = boost::filesystem;
+
+using DownloadDirTest = testing::UpdateStepTest;
+
+TEST_F(DownloadDirTest, ProtectsRootsTheCurrentDirectoryAndItsAncestors) {
+  fs::create_symlink(dir(), dir() / "downloads" / "link");
+  for (const std::string& path : {std::string("."), std::string(), dir().string() + "/", dir().parent_path().string(),
+                                  std::string("/"), std::string("downloads/.."), (dir() / "downloads/link").string()}) {
+    EXPECT_TRUE(isProtectedDirectory(path)) << path;
+  }
+  for (const std::string& path : {std::string("downloads"), (dir() / "downloads").string(), std::string("missing")}) {
+    EXPECT_FALSE(isProtectedDirectory(path)) << path;
+  }
+}
+
+TEST(JoinBundlePathTest, AddsASeparatorOnlyWhenMissing) {
+  EXPECT_EQ(joinBundlePath("d", "f.zip"), "d/f.zip");
+  EXPECT_EQ(joinBundlePath("d/", "f.zip"), "d/f.zip");
+}
+
+}  // namespace
+}  // namespace sorvik
