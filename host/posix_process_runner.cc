@@ -482,19 +482,16 @@ class PosixProcessRunner final : public ProcessRunner {
     const Clock::time_point after = Clock::now();
     for (auto& owned : children_) settleStdin(owned.get(), after);
     if (!checkExits) return;
-    bool removed = false;
-    for (auto& owned : children_) {
-      if (owned->reaped || !tryReap(owned.get())) continue;
-      finishChild(owned.get());
-      removed = true;
-    }
-    if (!removed) return;
     std::vector<std::unique_ptr<Child>> alive;
+    std::vector<std::unique_ptr<Child>> ended;
     for (auto& owned : children_) {
-      if (!owned->reaped) alive.push_back(std::move(owned));
+      (!owned->reaped && tryReap(owned.get()) ? ended : alive).push_back(std::move(owned));
     }
     children_.swap(alive);
+    if (ended.empty()) return;
+    // Counted out before the plug-in hears of the end.
     updateCount();
+    for (auto& child : ended) finishChild(child.get());
   }
 
   const RunnerOptions options_;

@@ -15,6 +15,8 @@ constexpr size_t kWriteRecordSize = 32;
 constexpr uint32_t kIoctlRunWorker = 1;
 constexpr uint32_t kIoctlConfiguration = 2;
 constexpr uint32_t kIoctlChildPacket = 4;
+constexpr std::chrono::milliseconds kWorkerStartLimit{5000};
+constexpr std::chrono::milliseconds kWorkerStopLimit{5000};
 
 // The host callback is a plain function pointer; it reaches the one
 // session of the process through this slot.
@@ -110,10 +112,23 @@ bool HostSession::loadPlugin(std::string* error) {
     gateIoctl_ = entry.ioctl;
   }
   entry.open();
-  worker_ = std::thread([ioctl = entry.ioctl] {
+  {
+    MutexLock lock(&workerMu_);
+    workerEntered_ = false;
+    workerDone_ = false;
+  }
+  worker_ = std::thread([this, ioctl = entry.ioctl] {
+    {
+      MutexLock lock(&workerMu_);
+      workerId_ = std::this_thread::get_id();
+    }
     unsigned char record[kIoctlRecordSize];
     fillIoctlRecord(record, kIoctlRunWorker, nullptr, 0);
     ioctl(record);
+    MutexLock lock(&workerMu_);
+    workerId_ = std::thread::id();
+    workerDone_ = true;
+    workerChanged_.signalAll();
   });
   loaded_ = true;
   notice("loaded " + options_.libraryPath + " (module id " + std::to_string(moduleId) + ")");
@@ -123,7 +138,12 @@ bool HostSession::loadPlugin(std::string* error) {
 void HostSession::unloadPlugin() {
   if (!loaded_) return;
   const PluginEntryPoints entry = library_.entry();
+  if (!waitWorker(&workerEntered_, kWorkerStartLimit)) notice("the worker has not reported; closing anyway");
   entry.close();
+  while (!waitWorker(&workerDone_, kWorkerStopLimit)) {
+    notice("the worker is still running; calling Close again");
+    entry.close();
+  }
   if (worker_.joinable()) worker_.join();
   {
     // No delivery may still be inside the library when it goes away.
@@ -135,6 +155,13 @@ void HostSession::unloadPlugin() {
   library_.close();
   loaded_ = false;
   notice("plug-in unloaded");
+}
+
+bool HostSession::waitWorker(bool* flag, std::chrono::milliseconds limit) {
+  const auto deadline = std::chrono::steady_clock::now() + limit;
+  MutexLock lock(&workerMu_);
+  while (!*flag && !workerDone_ && std::chrono::steady_clock::now() < deadline) waitWorkerChange(deadline);
+  return *flag || workerDone_;
 }
 
 void HostSession::deliver(const unsigned char* packet, size_t length) {
@@ -167,6 +194,13 @@ int32_t HostSession::callback(void* message, uint64_t /*reserved*/) {
 }
 
 int32_t HostSession::onMessage(const void* raw) {
+  {
+    MutexLock lock(&workerMu_);
+    if (!workerEntered_ && workerId_ == std::this_thread::get_id()) {
+      workerEntered_ = true;
+      workerChanged_.signalAll();
+    }
+  }
   const ko::core::HostMessage message = ko::core::copyHostMessage(raw);
   if (message.target() == ko::core::kTargetChildProcess) {
     if (!runnerUp_.load()) return -1;

@@ -6,6 +6,7 @@
 // runner, and Close, join, Unload on the way out or for a restart.
 
 #include <atomic>
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -77,6 +78,21 @@ class HostSession {
   PluginLibrary library_ GUARDED_BY(lifecycleMu_);
   std::thread worker_ GUARDED_BY(lifecycleMu_);
   bool loaded_ GUARDED_BY(lifecycleMu_) = false;
+
+  // The worker's progress. The plug-in sets its running flag when IOCTL
+  // code 1 enters, so a Close that comes earlier would be undone: the host
+  // waits for the worker's first callback (it reports its state at once)
+  // before closing, and repeats Close while the worker has not returned.
+  bool waitWorker(bool* flag, std::chrono::milliseconds limit) EXCLUDES(workerMu_);
+  void waitWorkerChange(std::chrono::steady_clock::time_point deadline) REQUIRES(workerMu_)
+      NO_THREAD_SAFETY_ANALYSIS {
+    workerChanged_.waitUntil(deadline);
+  }
+  Mutex workerMu_;
+  CondVar workerChanged_{&workerMu_};
+  std::thread::id workerId_ GUARDED_BY(workerMu_);
+  bool workerEntered_ GUARDED_BY(workerMu_) = false;
+  bool workerDone_ GUARDED_BY(workerMu_) = false;
 
   Mutex gateMu_;
   CondVar gateIdle_{&gateMu_};
