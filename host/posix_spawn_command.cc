@@ -78,7 +78,12 @@ class SpawnSetup {
     sigfillset(&all);
     int rc = ::posix_spawnattr_setsigmask(&attr_, &none);
     if (rc == 0) rc = ::posix_spawnattr_setsigdefault(&attr_, &all);
-    if (rc == 0) rc = ::posix_spawnattr_setflags(&attr_, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
+    // A process group of its own: a Ctrl-C at the host's terminal is for the
+    // host, which then closes the plug-in in order.
+    if (rc == 0) rc = ::posix_spawnattr_setpgroup(&attr_, 0);
+    if (rc == 0) {
+      rc = ::posix_spawnattr_setflags(&attr_, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETPGROUP);
+    }
     if (rc != 0) return rc;
     if (command.piped) {
       for (auto& p : pipes_) {
