@@ -22,7 +22,9 @@ TEST(HostRecordsTest, LoadParmsAreReadAndWrittenAtTheirOffsetsOnly) {
   EXPECT_EQ(out[55], 1);
   for (size_t i = 0; i < out.size(); ++i) {
     const bool written = (i >= 8 && i < 12) || (i >= 20 && i < 24) || i == 52 || i == 55;
-    if (!written) EXPECT_EQ(out[i], 0xAB) << "byte " << i << " must stay as the host left it";
+    if (!written) {
+      EXPECT_EQ(out[i], 0xAB) << "byte " << i << " must stay as the host left it";
+    }
   }
 }
 
