@@ -19,12 +19,13 @@ target_link_libraries(sorvik_host_tests PRIVATE sorvik_host_core sorvik_kelp_cor
 add_dependencies(sorvik_host_tests sorvik-host kelp sorvik_host_test_plugin)
 gtest_discover_tests(sorvik_host_tests DISCOVERY_TIMEOUT 60 PROPERTIES TIMEOUT 120)
 
-# The restart of the real plug-in, in its own binary so that the other host
+# The real plug-in under the host, in its own binary so that the other host
 # tests do not depend on the plug-in building.
 add_executable(sorvik_host_plugin_restart_tests ${CMAKE_CURRENT_LIST_DIR}/host_plugin_restart_test.cc)
 target_compile_definitions(sorvik_host_plugin_restart_tests PRIVATE
   SORVIK_HOST_PATH="$<TARGET_FILE:sorvik-host>"
+  KELP_PATH="$<TARGET_FILE:kelp>"
   SORVIK_PLUGIN_PATH="$<TARGET_FILE:sorvik>")
 target_link_libraries(sorvik_host_plugin_restart_tests PRIVATE sorvik_test_support GTest::gtest GTest::gtest_main)
-add_dependencies(sorvik_host_plugin_restart_tests sorvik-host sorvik)
+add_dependencies(sorvik_host_plugin_restart_tests sorvik-host kelp sorvik)
 gtest_discover_tests(sorvik_host_plugin_restart_tests DISCOVERY_TIMEOUT 60 PROPERTIES TIMEOUT 120)
