@@ -30,8 +30,7 @@ bool isProtectedDirectory(const std::string& directory) {
 
 bool clearDownloadDir(const std::string& directory) {
   if (isProtectedDirectory(directory)) {
-    ko::core::log(ko::core::kLogRejected,
-                  "Refusing to clear download directory (%s): it holds the server's own files.",
+    ko::core::log(ko::core::kLogRejected, "Refusing to clear download directory (%s): it holds the server's own files.",
                   directory.c_str());
     return false;
   }
@@ -57,10 +56,11 @@ bool ensureDataDirectory() {
 
 std::string joinBundlePath(const std::string& directory, const std::string& name) {
   const std::string separator = platform::pathSeparator();
-  const bool endsWithSeparator =
-      !directory.empty() && (directory.back() == '/' ||
-                             (directory.size() >= separator.size() &&
-                              directory.compare(directory.size() - separator.size(), separator.size(), separator) == 0));
+  auto endsWith = [&directory](const std::string& suffix) {
+    return directory.size() >= suffix.size() &&
+           directory.compare(directory.size() - suffix.size(), suffix.size(), suffix) == 0;
+  };
+  const bool endsWithSeparator = !directory.empty() && (endsWith("/") || endsWith(separator));
   return endsWithSeparator ? directory + name : directory + separator + name;
 }
 

@@ -83,8 +83,10 @@ TEST_F(DownloadTest, CredentialsTravelOnlyOnCurlsStandardInput) {
 }
 
 TEST_F(DownloadTest, CurlFailuresAreMappedAndExplained) {
-  for (const auto& [exitCode, status] : std::vector<std::pair<int32_t, int32_t>>{
-           {22, DOWNLOAD_HOST_ERROR}, {60, CURL_CERTIFICATE_ERROR}, {23, DOWNLOAD_FILE_IO_ERROR}, {2, DOWNLOAD_ERROR}}) {
+  for (const auto& [exitCode, status] : std::vector<std::pair<int32_t, int32_t>>{{22, DOWNLOAD_HOST_ERROR},
+                                                                                 {60, CURL_CERTIFICATE_ERROR},
+                                                                                 {23, DOWNLOAD_FILE_IO_ERROR},
+                                                                                 {2, DOWNLOAD_ERROR}}) {
     host().clearRecords();
     host().setScript("./curl", ChildScript::exitsOnStdinClose(exitCode, "", " 10 1k\rcurl: (22) error: 404\n"));
     std::string bundlePath;

@@ -34,7 +34,9 @@ class InstallTest : public testing::UpdateStepTest {
     }
     return tail;
   }
-  bool pendingMarkSaved() const { return readFile(dir() / "update.xml").find("PendingUpdate=\"1\"") != std::string::npos; }
+  bool pendingMarkSaved() const {
+    return readFile(dir() / "update.xml").find("PendingUpdate=\"1\"") != std::string::npos;
+  }
 
   const std::string bundle_ = "downloads/f.zip";
 };
@@ -49,8 +51,8 @@ TEST_F(InstallTest, EveryScriptEndSeenIsAFailureWithItsLog) {
     EXPECT_EQ(start.text_a, "");
     EXPECT_EQ(start.args, (std::vector<std::string>{"scripts/update.ps1", bundle_}));
     EXPECT_EQ(statuses(), (std::vector<int32_t>{BUNDLE_INSTALL, PENDING_UPDATE, -exitCode}));
-    EXPECT_EQ(logTail(3), (std::vector<std::string>{"75 Update failed (" + std::to_string(-exitCode) + "):",
-                                                    "75   step one", "75   last"}));
+    EXPECT_EQ(logTail(3), (std::vector<std::string>{
+                              "75 Update failed (" + std::to_string(-exitCode) + "):", "75   step one", "75   last"}));
     EXPECT_FALSE(pendingMarkSaved());  // the final save drops the mark
   }
 

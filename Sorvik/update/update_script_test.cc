@@ -94,7 +94,8 @@ class UpdateScriptTest : public ::testing::Test {
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
     while (true) {
       pollfd fd = {hangupPipe[0], POLLIN, 0};
-      const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
+      const auto left =
+          std::chrono::duration_cast<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
       const int ready = ::poll(&fd, 1, static_cast<int>(std::max<int64_t>(left.count(), 0)));
       if (ready == 1) break;
       if (ready == 0 || errno != EINTR) return false;  // EINTR: the signal itself
