@@ -71,7 +71,7 @@ struct Child {
   }
 };
 
-enum class ItemKind { Packet, Detach, Stop };
+enum class ItemKind { Packet, Flush, Detach, Stop };
 struct Item {
   ItemKind kind = ItemKind::Packet;
   std::string bytes;
@@ -115,18 +115,9 @@ class PosixProcessRunner final : public ProcessRunner {
     post(std::move(item));
   }
 
-  void detachAll() override {
-    uint64_t ticket;
-    {
-      MutexLock lock(&mu_);
-      if (!running_) return;
-      ticket = ++detachRequested_;
-      queue_.push_back(Item{ItemKind::Detach, {}});
-    }
-    wake();
-    MutexLock lock(&mu_);
-    while (detachDone_ < ticket && running_) waitForRunner();
-  }
+  void flush() override { barrier(ItemKind::Flush); }
+
+  void detachAll() override { barrier(ItemKind::Detach); }
 
   void stop() override {
     {
@@ -147,6 +138,21 @@ class PosixProcessRunner final : public ProcessRunner {
   // CondVar's annotation names its own mutex pointer, which the analysis
   // cannot equate with mu_.
   void waitForRunner() REQUIRES(mu_) NO_THREAD_SAFETY_ANALYSIS { cv_.wait(); }
+
+  // Queues `kind` behind everything submitted so far and waits until the
+  // runner thread has reached it.
+  void barrier(ItemKind kind) {
+    uint64_t ticket;
+    {
+      MutexLock lock(&mu_);
+      if (!running_) return;
+      ticket = ++barriersRequested_;
+      queue_.push_back(Item{kind, {}});
+    }
+    wake();
+    MutexLock lock(&mu_);
+    while (barriersDone_ < ticket && running_) waitForRunner();
+  }
 
   void post(Item item) {
     {
@@ -177,10 +183,10 @@ class PosixProcessRunner final : public ProcessRunner {
           stopping = true;
           break;
         }
-        if (item.kind == ItemKind::Detach) {
-          detachChildren();
+        if (item.kind == ItemKind::Flush || item.kind == ItemKind::Detach) {
+          if (item.kind == ItemKind::Detach) detachChildren();
           MutexLock lock(&mu_);
-          ++detachDone_;
+          ++barriersDone_;
           cv_.signalAll();
           continue;
         }
@@ -505,8 +511,8 @@ class PosixProcessRunner final : public ProcessRunner {
   CondVar cv_{&mu_};
   std::deque<Item> queue_ GUARDED_BY(mu_);
   bool running_ GUARDED_BY(mu_) = false;
-  uint64_t detachRequested_ GUARDED_BY(mu_) = 0;
-  uint64_t detachDone_ GUARDED_BY(mu_) = 0;
+  uint64_t barriersRequested_ GUARDED_BY(mu_) = 0;
+  uint64_t barriersDone_ GUARDED_BY(mu_) = 0;
   size_t childCount_ GUARDED_BY(mu_) = 0;
 
   std::vector<std::unique_ptr<Child>> children_;  // runner thread only

@@ -64,6 +64,10 @@ class ProcessRunner {
   // Queues one packet from the plug-in (copied). Never blocks on a child.
   virtual void submit(const unsigned char* packet, size_t length) = 0;
 
+  // Returns once every packet submitted before the call is handled and its
+  // answer (such as Started) delivered.
+  virtual void flush() = 0;
+
   // Forgets every child's id once all packets submitted before the call are
   // handled: the children keep running, their output is read and dropped,
   // and their end is only noticed. Returns when done. Used across a plug-in

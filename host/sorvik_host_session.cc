@@ -64,6 +64,9 @@ bool HostSession::start(std::string* error) {
 bool HostSession::restart(std::string* error) {
   MutexLock lock(&lifecycleMu_);
   notice("restarting the plug-in");
+  // A child may ask for the restart before its Started packet reached the
+  // plug-in; Close would leave that start unanswered.
+  runner_->flush();
   unloadPlugin();
   // The new instance numbers its children from the start again.
   runner_->detachAll();
