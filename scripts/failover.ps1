@@ -9,7 +9,11 @@
 #      host's current directory);
 #   2. if SORVIK_FAILOVER_EXIT is set, exits at once with that code, to try
 #      the plug-in's failure report;
-#   3. otherwise stays running for SORVIK_FAILOVER_HOLD seconds (default 900,
+#   3. under the development host (SORVIK_HOST_PID set) and unless
+#      SORVIK_FAILOVER_RESTART is 0, asks the host to restart the plug-in,
+#      as the production script's service restart does, and ends a few
+#      seconds later, after the restart has closed the plug-in;
+#   4. otherwise stays running for SORVIK_FAILOVER_HOLD seconds (default 900,
 #      longer than the plug-in's default 600-second limit), like a script that
 #      is still at work when the host goes down. It gives up early when the
 #      process that started it is gone, so no stray copy outlives the host.
@@ -26,6 +30,11 @@ if [ -n "${SORVIK_FAILOVER_EXIT:-}" ]; then
 fi
 
 hold="${SORVIK_FAILOVER_HOLD:-900}"
+if [ -n "${SORVIK_HOST_PID:-}" ] && [ "${SORVIK_FAILOVER_RESTART:-1}" != "0" ]; then
+  echo "$(date -u '+%Y-%m-%dT%H:%M:%SZ') asking the host to restart" >> logs/failover.log
+  kill -HUP "$SORVIK_HOST_PID"
+  hold=5
+fi
 case "$hold" in
   ''|*[!0-9]*) hold=900 ;;
 esac

@@ -36,7 +36,8 @@ class SCOPED_CAPABILITY MutexLock {
 };
 
 // Condition variable bound to one Mutex; callers hold that mutex around
-// every wait and re-test their predicate after each wake-up.
+// every wait and re-test their predicate after each wake-up. The waits carry
+// no annotation: the analysis cannot tie the bound mutex to the caller's.
 class CondVar {
  public:
   using Clock = std::chrono::steady_clock;
@@ -45,13 +46,13 @@ class CondVar {
   CondVar(const CondVar&) = delete;
   CondVar& operator=(const CondVar&) = delete;
 
-  void wait() REQUIRES(mu_) {
+  void wait() {
     std::unique_lock<std::mutex> lock(mu_->mu_, std::adopt_lock);
     cv_.wait(lock);
     lock.release();
   }
   // False once the deadline has passed.
-  bool waitUntil(Clock::time_point deadline) REQUIRES(mu_) {
+  bool waitUntil(Clock::time_point deadline) {
     std::unique_lock<std::mutex> lock(mu_->mu_, std::adopt_lock);
     const bool notTimedOut = cv_.wait_until(lock, deadline) == std::cv_status::no_timeout;
     lock.release();
