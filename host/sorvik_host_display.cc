@@ -106,21 +106,40 @@ void Display::show(const Event& event) {
   const bool progress = terminal_ && event.kind == EventKind::Document && parseDownloadProgress(event.text, &percent);
   const std::string line = progress ? progressBar(percent) : formatEvent(event);
   MutexLock lock(&mu_);
+  clearPrompt();
   if (progress) {
     std::fprintf(out_, "\r\033[K%s", line.c_str());
     progressShown_ = true;
   } else {
     endProgressLine();
     std::fprintf(out_, "%s\n", line.c_str());
+    redrawPrompt();
   }
+  std::fflush(out_);
+}
+
+void Display::prompt(const std::string& text) {
+  MutexLock lock(&mu_);
+  endProgressLine();
+  prompt_ = text;
+  std::fputs(text.c_str(), out_);
   std::fflush(out_);
 }
 
 void Display::say(const std::string& text) {
   MutexLock lock(&mu_);
+  prompt_.clear();  // the user has answered it
   endProgressLine();
   std::fprintf(out_, "%s\n", text.c_str());
   std::fflush(out_);
+}
+
+void Display::clearPrompt() {
+  if (terminal_ && !prompt_.empty()) std::fputs("\r\033[K", out_);
+}
+
+void Display::redrawPrompt() {
+  if (terminal_ && !prompt_.empty()) std::fputs(prompt_.c_str(), out_);
 }
 
 void Display::endProgressLine() {

@@ -33,14 +33,20 @@ class Display {
   void show(const Event& event);
   // A line of the host's own (prompt answers, errors), without time stamp.
   void say(const std::string& text);
+  // Shows the prompt; on a terminal, lines that arrive while it waits are
+  // printed above it and the prompt is drawn again.
+  void prompt(const std::string& text);
 
  private:
   void endProgressLine() REQUIRES(mu_);
+  void clearPrompt() REQUIRES(mu_);
+  void redrawPrompt() REQUIRES(mu_);
 
   std::FILE* const out_;
   const bool terminal_;
   Mutex mu_;
   bool progressShown_ GUARDED_BY(mu_) = false;
+  std::string prompt_ GUARDED_BY(mu_);  // shown and waiting for input when not empty
 };
 
 }  // namespace sorvik::host

@@ -54,6 +54,12 @@ instruction ends the host with exit code 1; at the prompt it is only reported.
 
 %s
 
+Children: a program path with a slash (./curl, ./kelp, scripts/update.ps1)
+is taken relative to the working directory; a bare name is looked up there
+and then in PATH. *.ps1 programs run through the --ps1-interpreter. Children
+started with pipes (flag value 2) exchange stdin/stdout/stderr with the
+plug-in; others get /dev/null as stdin.
+
 Children get SORVIK_HOST_PID, the host's process id, in their environment:
 `kill -HUP $SORVIK_HOST_PID` restarts the plug-in (Close, Unload, reload,
 Load, Open) while the children keep running. SIGINT and SIGTERM close the
@@ -215,11 +221,9 @@ int run(const Options& options) {
   int lineNumber = 0;
   std::string line;
   while (true) {
-    if (interactive) {
-      std::fputs("sorvik> ", stdout);
-      std::fflush(stdout);
-    }
+    if (interactive) display.prompt("sorvik> ");
     const ReadResult read = reader.next(&line);
+    if (interactive) display.prompt("");
     if (read != ReadResult::Line) break;
     ++lineNumber;
     const size_t first = line.find_first_not_of(" \t\r");
