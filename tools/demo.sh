@@ -23,7 +23,7 @@ log=$demo/host.log
 
 cp "$build/Sorvik/libsorvik.so" "$work/libsorvik.so"
 ln -s "$(command -v curl)" "$work/curl"
-ln -s "$build/host/kelp" "$work/kelp"
+ln -s "$build/bin/kelp" "$work/kelp"
 cp "$root/scripts/update.ps1" "$root/scripts/failover.ps1" "$work/scripts/"
 tar czf "$demo/served/sorvik-$next.tar.gz" -C "$build/next" libsorvik.so
 md5=$(md5sum "$demo/served/sorvik-$next.tar.gz" | cut -d' ' -f1)
@@ -44,7 +44,7 @@ url="http://127.0.0.1:$(cat "$demo/port")/sorvik-$next.tar.gz"
 # The host reads instructions from a pipe so that this script can act on
 # what it reports (the agent's port) between instructions.
 mkfifo "$demo/host-in"
-"$build/host/sorvik-host" -C "$work" -l PROGRESS -w 60 "$work/libsorvik.so" <"$demo/host-in" >"$log" 2>&1 &
+"$build/bin/sorvik-host" -C "$work" -l PROGRESS -w 60 "$work/libsorvik.so" <"$demo/host-in" >"$log" 2>&1 &
 host_pid=$!
 pids+=($host_pid)
 exec 3>"$demo/host-in"
@@ -70,31 +70,41 @@ say "wait -t 60 Version=\"$next\""
 say "wait -t 30 Status=\"13\""
 
 say "echo ===== Failover roles"
-say "drives $demo/drives/spare-d1"
+say "failover COMMISSIONED"
+say "wait FailoverStatus=\"-102\""
+say "echo demo: PROTECTED to COMMISSIONED was refused, as the state machine requires"
+say "failover DECOMMISSION_FAILOVER"
+say "wait FailoverStatus=\"101\""
+say "wait -t 30 plug-in restarted"
+say "wait FailoverState=\"102\""
+say "wait SpareResetStatus"
 say "failover COMMISSIONED"
 say "wait FailoverStatus=\"104\""
-say "failover DECOMMISSION_ACTIVE"
-say "wait FailoverStatus=\"-102\""
 say "failover RESERVE_SPARE"
-say "wait FailoverStatus=\"105\""
+say "wait FailoverStatus=\"101\""
+say "wait -t 30 plug-in restarted"
+say "wait FailoverState=\"105\""
+# Commands wait until the restarted worker has reported its state.
+say "wait SpareResetStatus"
 
+echo "disk image" >"$demo/drives/spare-d1/recording.bin"
+touch "$demo/drives/spare-d1/.kelp-spare"
 say "echo ===== Failback agent"
-say "agent-start now-86400 now demo-token 7066"
+say "drives $demo/drives/spare-d1"
+say "agent-start now-86400 now+60 demo-token 7066"
 say "wait -t 30 FailbackStatus=\"202\""
-await 'FailbackStatus="202" Port="[0-9]+"' 60
+await 'FailbackStatus="202" Port="[0-9]+"' 120
 port=$(grep -Eo 'FailbackStatus="202" Port="[0-9]+"' "$log" | tail -1 | grep -Eo '[0-9]+"$' | tr -d '"')
-if curl -fsS --max-time 5 -H "X-Kelp-Token: demo-token" "http://127.0.0.1:$port/" >"$demo/agent-reply"; then
-  say "echo demo: the failback agent answered on port $port"
+if curl -fsS --max-time 5 -H "Authorization: Bearer demo-token" "http://127.0.0.1:$port/files" >"$demo/agent-reply"; then
+  say "echo demo: the failback agent answered on port $port: $(tr '\t\n' '  ' <"$demo/agent-reply")"
 else
   say "echo demo: the failback agent did not answer on port $port"
 fi
 say "agent-stop"
 say "wait -t 30 FailbackStatus=\"200\""
 
-echo "disk image" >"$demo/drives/spare-d1/recording.bin"
-touch "$demo/drives/spare-d1/.kelp-spare"
 say "echo ===== Spare reset"
-say "agent-reset now-60 now demo-token"
+say "agent-reset now-60 now"
 say "wait -t 30 SpareResetStatus=\"205\""
 say "quit"
 exec 3>&-
@@ -109,15 +119,17 @@ echo
 echo "===== Summary"
 check "version $version announced" "Module Name=\"Sorvik\" ID=\"3670016\" Version=\"$version\""
 check "download progress reported" 'Status="1" Progress="[1-9]'
-check "checksum passed" "Received checksum|checksum.*(match|pass)"
+check "checksum passed" "Received checksum \\($md5\\)"
 check "installation script started (PENDING_UPDATE)" 'Status="3"'
 check "host restarted by the script" "restart"
 check "version $next announced after the restart" "Version=\"$next\""
 check "UPDATE_SUCCESS reported" 'Status="13"'
 [ -s "$work/logs/update.log" ] && echo "  [ok]      logs/update.log written" || { echo "  [MISSING] logs/update.log"; status=1; }
-check "failover role COMMISSIONED" 'FailoverStatus="104"'
 check "refused transition (NOT_PERMITTED)" 'FailoverStatus="-102"'
-check "failover role RESERVE_SPARE" 'FailoverStatus="105"'
+check "decommission script run (DECOMMISSION_PENDING)" 'FailoverStatus="101"'
+check "role DECOMMISSION_FAILOVER after the restart" 'FailoverState="102"'
+check "role COMMISSIONED" 'FailoverStatus="104"'
+check "role RESERVE_SPARE after the restart" 'FailoverState="105"'
 check "failback agent READY on its port" 'FailbackStatus="202" Port="[0-9]+"'
 check "failback agent reached on its port" "the failback agent answered on port"
 check "failback agent stopped (NONE)" 'FailbackStatus="200"'
