@@ -5,6 +5,7 @@
 #include "Sorvik/update/checksum.h"
 #include "Sorvik/update/download.h"
 #include "Sorvik/update/install.h"
+#include "Sorvik/update/location.h"
 
 namespace sorvik {
 namespace {
@@ -28,6 +29,7 @@ class PluginSteps final : public WorkerSteps {
   void StartReset(UpdateService& service, const std::string& drives, AgentRequestRecord& request) override {
     sorvik::StartReset(service, drives, request);
   }
+  std::string LocationForLog(const std::string& location) override { return redactLocation(location); }
   void StopAgent(UpdateService& service, std::shared_ptr<ko::ipc::client>& handle, uint32_t exitCode) override {
     sorvik::StopAgent(service, handle, exitCode);
   }

@@ -63,7 +63,7 @@ void UpdateService::processCommand(const unsigned char* data, size_t length) {
       log(kLogProgress, "Ignore update request with empty location.");
       continue;
     }
-    log(kLogProgress, "Update to %s", locationForLog(location).c_str());
+    log(kLogProgress, "Update to %s", (steps_ != nullptr ? steps_->LocationForLog(location) : locationForLog(location)).c_str());
     log(kLogProgress, "Update checksum %s", checksum.c_str());
     {
       MutexLock lock(&stateMutex);

@@ -1,5 +1,7 @@
 #include "Sorvik/service/location_text.h"
 
+#include "Sorvik/service/update_service.h"
+
 namespace sorvik {
 
 std::string locationForLog(const std::string& location) {
@@ -12,5 +14,7 @@ std::string locationForLog(const std::string& location) {
   if (location.find(':', userStart) >= at) return location;
   return location.substr(0, userStart) + "****" + location.substr(at);
 }
+
+std::string WorkerSteps::LocationForLog(const std::string& location) { return locationForLog(location); }
 
 }  // namespace sorvik

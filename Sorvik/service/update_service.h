@@ -156,6 +156,10 @@ class UpdateService {
 class WorkerSteps {
  public:
   virtual ~WorkerSteps() = default;
+  // The location as a log line may show it, its password as "***". The
+  // update layer knows the location grammar; this fallback hides the whole
+  // user and password.
+  virtual std::string LocationForLog(const std::string& location);
   // True when the bundle was downloaded; `bundlePath` receives its path.
   virtual bool DownloadBundle(UpdateService& service, const std::string& location, std::string& bundlePath) = 0;
   virtual bool VerifyBundleChecksum(UpdateService& service, const std::string& bundlePath,
