@@ -21,6 +21,7 @@ class SignalPipe {
 enum class ReadResult { Line, EndOfInput, Interrupted };
 
 // Reads lines from `fd` without stdio so that `stopFd` can interrupt.
+// Thread-compatible: used by the one input thread.
 class LineReader {
  public:
   LineReader(int fd, int stopFd) : fd_(fd), stopFd_(stopFd) {}
@@ -34,6 +35,7 @@ class LineReader {
 };
 
 // A pipe whose read end becomes readable once `raise` was called.
+// Thread-safe: `raise` is one write(2), and the descriptors never change.
 class StopPipe {
  public:
   StopPipe();
