@@ -93,6 +93,9 @@ TEST(HostDocumentsTest, TimesWordsAndSecretsAreParsedAndMasked) {
   EXPECT_EQ(maskInstruction("write <Update PasswordToken=\"s3cret\" Port=\"1\" />"),
             "write <Update PasswordToken=\"***\" Port=\"1\" />");
   EXPECT_EQ(maskSecrets("PasswordToken='a' PasswordToken=\"b"), "PasswordToken='***' PasswordToken=\"***");
+  EXPECT_EQ(maskInstruction("update ftp://me:p@ss@h:21/b.zip abc"), "update ftp://me:***@h:21/b.zip abc");
+  EXPECT_EQ(maskSecrets("<Update Location=\"https://u:pw@h/x\" />"), "<Update Location=\"https://u:***@h/x\" />");
+  EXPECT_EQ(maskInstruction("update https://h:8443/a@b"), "update https://h:8443/a@b");
 
   int percent = 0;
   EXPECT_TRUE(parseDownloadProgress("<?xml ?><Qora><Update ID=\"3670016\" Status=\"1\" Progress=\"42\" /></Qora>",
