@@ -54,7 +54,8 @@ class EventLog {
 
   void add(Event event);
   // Waits until an event after the previous match matches `pattern`; on a
-  // match everything up to it is consumed.
+  // match everything up to it is consumed. One waiter at a time (the
+  // script thread).
   WaitResult waitFor(const EventPattern& pattern, std::chrono::steady_clock::time_point deadline, Event* matched);
   // Ends current and future waits (the host is quitting).
   void interrupt();
