@@ -24,42 +24,10 @@
 
 #include "Sorvik/platform/platform.h"
 #include "host/fake_host.h"
+#include "host/test_watchdog.h"
 #include "Sorvik/service/update_service.h"
 
 namespace sorvik::testing {
-
-// Aborts the process when a test is still running after `limit`, so that a
-// lost wake-up shows as a failure instead of a hung build.
-class Watchdog {
- public:
-  explicit Watchdog(std::chrono::seconds limit = std::chrono::seconds(30)) {
-    const std::string name = ::testing::UnitTest::GetInstance()->current_test_info() != nullptr
-                                 ? ::testing::UnitTest::GetInstance()->current_test_info()->name()
-                                 : "?";
-    thread_ = std::thread([this, limit, name] {
-      std::unique_lock<std::mutex> lock(mu_);
-      if (!cv_.wait_for(lock, limit, [this] { return done_; })) {
-        std::fprintf(stderr, "watchdog: test %s hung for %lld s\n", name.c_str(),
-                     static_cast<long long>(limit.count()));
-        std::abort();
-      }
-    });
-  }
-  ~Watchdog() {
-    {
-      std::lock_guard<std::mutex> lock(mu_);
-      done_ = true;
-    }
-    cv_.notify_all();
-    thread_.join();
-  }
-
- private:
-  std::mutex mu_;
-  std::condition_variable cv_;
-  bool done_ = false;
-  std::thread thread_;
-};
 
 // The machine's platform with a scripted process table and a record of
 // every state-file write.

@@ -17,8 +17,17 @@
 #include "Sorvik/ipc/client.h"
 #include "Sorvik/ipc/packet.h"
 #include "Sorvik/platform/mutex.h"
+#include "host/test_watchdog.h"
 
 namespace ko::ipc::testing {
+
+// A stuck wait on a child is ended by emptying the registry.
+class Watchdog : public sorvik::testing::Watchdog {
+ public:
+  explicit Watchdog(std::chrono::seconds limit = std::chrono::seconds(10))
+      : sorvik::testing::Watchdog(limit, [] { ko::ipc::shutdown(false); }) {}
+};
+
 
 inline constexpr uint32_t kIdBase = 0x380000;
 
@@ -36,46 +45,6 @@ inline std::string makePacket(PacketType type, uint32_t id, uint32_t value, cons
 inline bool deliverNow(const std::string& packet) {
   return receive(reinterpret_cast<const unsigned char*>(packet.data()), packet.size());
 }
-
-// Fails the test after `limit`, then ends every registered child so that
-// blocked waiters return; aborts if the test is still stuck after that.
-// Thread-safe: `done_` is guarded by `mu_`.
-class Watchdog {
- public:
-  explicit Watchdog(std::chrono::seconds limit = std::chrono::seconds(10)) {
-    thread_ = std::thread([this, limit] { watch(limit); });
-  }
-  ~Watchdog() {
-    {
-      sorvik::MutexLock lock(&mu_);
-      done_ = true;
-      cv_.signalAll();
-    }
-    thread_.join();
-  }
-
- private:
-  void watch(std::chrono::seconds limit) {
-    sorvik::MutexLock lock(&mu_);
-    if (waitDone(sorvik::saturatingDeadline(limit))) return;
-    ADD_FAILURE() << "watchdog: test still blocked after " << limit.count() << " s";
-    ko::ipc::shutdown(false);
-    if (waitDone(sorvik::saturatingDeadline(std::chrono::seconds(5)))) return;
-    std::fprintf(stderr, "watchdog: test hung, aborting\n");
-    std::abort();
-  }
-  bool waitDone(sorvik::CondVar::Clock::time_point deadline) REQUIRES(mu_) NO_THREAD_SAFETY_ANALYSIS {
-    while (!done_) {
-      if (!cv_.waitUntil(deadline)) return done_;
-    }
-    return true;
-  }
-
-  sorvik::Mutex mu_;
-  sorvik::CondVar cv_{&mu_};
-  bool done_ GUARDED_BY(mu_) = false;
-  std::thread thread_;
-};
 
 // Installs a lambda transport that records every packet and answers start
 // requests from a delivering thread of its own (never inside the transport

@@ -16,9 +16,9 @@ constexpr uint32_t kIdAttempts = 0x100000;
 }  // namespace
 
 Registry& Registry::instance() {
-  // Never destroyed: host threads may still deliver while the library unloads.
-  static Registry* registry = new Registry();
-  return *registry;
+  // Destroyed when the library is unloaded; the host delivers nothing after Unload.
+  static Registry registry;
+  return registry;
 }
 
 void Registry::setTransport(Transport transport) {

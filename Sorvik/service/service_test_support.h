@@ -23,6 +23,7 @@
 #include "Sorvik/service/update_service.h"
 #include "Sorvik/service/worker_wait.h"
 #include "host/fake_host.h"
+#include "host/test_watchdog.h"
 
 namespace sorvik::testing {
 
@@ -61,36 +62,6 @@ inline std::string readFile(const std::string& path) {
   std::ifstream in(path, std::ios::binary);
   return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
 }
-
-// Calls `rescue` and then aborts the process if a test body outlives its
-// deadline, so that a hang turns into a failure.
-class Watchdog {
- public:
-  explicit Watchdog(std::function<void()> rescue, std::chrono::seconds limit = std::chrono::seconds(20))
-      : thread_([this, rescue = std::move(rescue), limit] {
-          std::unique_lock<std::mutex> lock(mu_);
-          if (cv_.wait_for(lock, limit, [this] { return done_; })) return;
-          lock.unlock();
-          std::fprintf(stderr, "watchdog: test exceeded %llds, stopping it\n", static_cast<long long>(limit.count()));
-          rescue();
-          lock.lock();
-          if (!cv_.wait_for(lock, std::chrono::seconds(5), [this] { return done_; })) std::abort();
-        }) {}
-  ~Watchdog() {
-    {
-      std::lock_guard<std::mutex> lock(mu_);
-      done_ = true;
-    }
-    cv_.notify_all();
-    thread_.join();
-  }
-
- private:
-  std::mutex mu_;
-  std::condition_variable cv_;
-  bool done_ = false;
-  std::thread thread_;
-};
 
 // Records every step the worker asks for. Agent starts spawn "./kelp"
 // through the fake host, so the agent is a real ko::ipc::client that the
@@ -214,7 +185,7 @@ class DrivenWait : public WorkerWait {
 class WorkerThread {
  public:
   explicit WorkerThread(UpdateService& service)
-      : service_(service), watchdog_([&service] { service.requestStop(); }), thread_([&service] {
+      : service_(service), watchdog_(std::chrono::seconds(20), [&service] { service.requestStop(); }), thread_([&service] {
           service.runWorker();
         }) {}
   ~WorkerThread() { stop(); }

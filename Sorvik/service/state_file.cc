@@ -37,8 +37,9 @@ std::string pendingPathOf(const std::string& path) { return path + ".pending"; }
 }  // namespace
 
 FileInUseRegistry& FileInUseRegistry::instance() {
-  static FileInUseRegistry* registry = new FileInUseRegistry;  // never destroyed: used until exit
-  return *registry;
+  // Destroyed with the library, so that a host's reload does not leak it.
+  static FileInUseRegistry registry;
+  return registry;
 }
 
 void FileInUseRegistry::acquire(const std::string& path) {

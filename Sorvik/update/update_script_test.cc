@@ -106,7 +106,7 @@ class UpdateScriptTest : public ::testing::Test {
 
   fs::path dir_;
   struct sigaction oldAction_ = {};
-  testing::UpdateWatchdog watchdog_{std::chrono::seconds(60)};
+  testing::Watchdog watchdog_{std::chrono::seconds(60)};
 };
 
 TEST_F(UpdateScriptTest, ReplacesTheLibraryByRenameAndRestartsTheHost) {

@@ -24,34 +24,9 @@
 
 #include "Sorvik/service/update_service.h"
 #include "host/fake_host.h"
+#include "host/test_watchdog.h"
 
 namespace sorvik::testing {
-
-class UpdateWatchdog {
- public:
-  explicit UpdateWatchdog(std::chrono::seconds limit = std::chrono::seconds(30))
-      : thread_([this, limit] {
-          std::unique_lock<std::mutex> lock(mu_);
-          if (!cv_.wait_for(lock, limit, [this] { return done_; })) {
-            std::fprintf(stderr, "watchdog: test hung\n");
-            std::abort();
-          }
-        }) {}
-  ~UpdateWatchdog() {
-    {
-      std::lock_guard<std::mutex> lock(mu_);
-      done_ = true;
-    }
-    cv_.notify_all();
-    thread_.join();
-  }
-
- private:
-  std::mutex mu_;
-  std::condition_variable cv_;
-  bool done_ = false;
-  std::thread thread_;
-};
 
 class UpdateStepTest : public ::testing::Test {
  protected:
@@ -120,7 +95,7 @@ class UpdateStepTest : public ::testing::Test {
   FakeHost& host() { return *host_; }
   const boost::filesystem::path& dir() const { return dir_; }
 
-  UpdateWatchdog watchdog_;
+  Watchdog watchdog_;
   std::unique_ptr<FakeHost> host_;
   std::unique_ptr<UpdateService> service_;
 
