@@ -1,0 +1,26 @@
+# Windows-only tests and the Windows side of the shared plug-in test.
+
+# The entry-point test loads the plug-in through <dlfcn.h>; here that is a
+# thin layer over LoadLibrary, and the DLL is found beside the test
+# executable as a host finds it beside its own.
+sorvik_windows_posix_compat(sorvik_entry_points_tests)
+get_target_property(_defs sorvik_entry_points_tests COMPILE_DEFINITIONS)
+list(FILTER _defs EXCLUDE REGEX "^SORVIK_PLUGIN_PATH=")
+list(APPEND _defs "SORVIK_PLUGIN_PATH=\"sorvik.dll\"")
+set_target_properties(sorvik_entry_points_tests PROPERTIES COMPILE_DEFINITIONS "${_defs}")
+
+file(GLOB _windows_tests CONFIGURE_DEPENDS ${CMAKE_CURRENT_LIST_DIR}/windows_*_test.cc)
+if(_windows_tests)
+  add_executable(sorvik_windows_tests ${_windows_tests})
+  target_include_directories(sorvik_windows_tests PRIVATE ${PROJECT_SOURCE_DIR})
+  target_link_libraries(sorvik_windows_tests PRIVATE
+    sorvik_service sorvik_platform sorvik_fake_host tinyxml_pkg GTest::gtest GTest::gtest_main)
+  gtest_discover_tests(sorvik_windows_tests DISCOVERY_TIMEOUT 60 PROPERTIES TIMEOUT 120)
+endif()
+
+if(TARGET sorvik_windows_tests)
+  add_executable(sorvik_windows_idle_child ${CMAKE_CURRENT_LIST_DIR}/windows_idle_child.cc)
+  add_dependencies(sorvik_windows_tests sorvik_windows_idle_child)
+  target_compile_definitions(sorvik_windows_tests PRIVATE
+    SORVIK_IDLE_CHILD="$<TARGET_FILE_NAME:sorvik_windows_idle_child>")
+endif()
