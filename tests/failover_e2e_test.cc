@@ -123,9 +123,7 @@ class FailoverEndToEnd : public ::testing::Test {
   }
 
   bool expect(const std::string& regex, std::chrono::milliseconds timeout = 15s, std::string* group = nullptr) {
-    const bool found = session_->waitFor(regex, timeout, group, mark_);
-    if (found) mark_ = session_->outputSize();
-    return found;
+    return session_->waitFor(regex, timeout, group, mark_, &mark_);
   }
 
   int quit() {

@@ -78,7 +78,7 @@ void HostSession::send(const std::string& line) {
 }
 
 bool HostSession::waitFor(const std::string& regex, std::chrono::milliseconds timeout, std::string* group,
-                          size_t from) {
+                          size_t from, size_t* matchEnd) {
   const std::regex pattern(regex);
   const auto deadline = std::chrono::steady_clock::now() + timeout;
   MutexLock lock(&mu_);
@@ -87,6 +87,7 @@ bool HostSession::waitFor(const std::string& regex, std::chrono::milliseconds ti
     const std::string tail = from < output_.size() ? output_.substr(from) : std::string();
     if (std::regex_search(tail, match, pattern)) {
       if (group != nullptr && match.size() > 1) *group = match[1].str();
+      if (matchEnd != nullptr) *matchEnd = from + static_cast<size_t>(match.position(0) + match.length(0));
       return true;
     }
     if (ended_) return false;
@@ -123,11 +124,6 @@ int HostSession::finish(std::chrono::milliseconds timeout) {
 std::string HostSession::output() const {
   MutexLock lock(&mu_);
   return output_;
-}
-
-size_t HostSession::outputSize() const {
-  MutexLock lock(&mu_);
-  return output_.size();
 }
 
 }  // namespace sorvik::testing

@@ -30,14 +30,14 @@ class HostSession {
   bool started() const { return pid_ > 0; }
   void send(const std::string& line);
   // Waits until the output from `from` on matches; fills the first capture
-  // group when asked. False on timeout or when the host ended first.
+  // group and the offset just past the match when asked. False on timeout
+  // or when the host ended first.
   bool waitFor(const std::string& regex, std::chrono::milliseconds timeout, std::string* group = nullptr,
-               size_t from = 0);
+               size_t from = 0, size_t* matchEnd = nullptr);
   // Closes the host's input, waits for its exit (killing it after
   // `timeout`) and returns its exit code, or -1 when it had to be killed.
   int finish(std::chrono::milliseconds timeout);
   std::string output() const;
-  size_t outputSize() const;
 
  private:
   void readLoop(int fd);
