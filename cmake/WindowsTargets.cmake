@@ -20,13 +20,13 @@ if(TARGET sorvik_next)
     ARCHIVE_OUTPUT_DIRECTORY ${CMAKE_BINARY_DIR}/next)
 endif()
 
-# Shared tests use a few POSIX calls (dlopen, setenv, mkdtemp); the test
-# builds get small Win32 versions of them.
+# Shared tests and tools use a few POSIX calls (dlopen, setenv, mkdtemp,
+# strptime, timegm, lstat); they get small Win32 versions of them.
 set(SORVIK_POSIX_COMPAT_DIR ${PROJECT_SOURCE_DIR}/Sorvik/platform/windows/posix_compat)
-add_library(sorvik_posix_compat STATIC ${SORVIK_POSIX_COMPAT_DIR}/dlfcn.cc ${SORVIK_POSIX_COMPAT_DIR}/unistd.cc)
+add_library(sorvik_posix_compat STATIC
+  ${SORVIK_POSIX_COMPAT_DIR}/dlfcn.cc ${SORVIK_POSIX_COMPAT_DIR}/unistd.cc ${SORVIK_POSIX_COMPAT_DIR}/time.cc
+  ${SORVIK_POSIX_COMPAT_DIR}/stat.cc)
 target_include_directories(sorvik_posix_compat BEFORE PUBLIC ${SORVIK_POSIX_COMPAT_DIR})
-# gmtime_r and localtime_r from MinGW's <time.h>.
-target_compile_definitions(sorvik_posix_compat PUBLIC _POSIX_THREAD_SAFE_FUNCTIONS)
 function(sorvik_windows_posix_compat target)
   target_link_libraries(${target} PRIVATE sorvik_posix_compat)
 endfunction()

@@ -1,4 +1,4 @@
-#include "unistd.h"
+#include <unistd.h>
 
 #include <windows.h>
 
