@@ -24,6 +24,7 @@
 
 #include "Sorvik/platform/platform.h"
 #include "host/fake_host.h"
+#include "host/test_temp_dir.h"
 #include "host/test_watchdog.h"
 #include "Sorvik/service/update_service.h"
 
@@ -98,11 +99,6 @@ class FailoverTest : public ::testing::Test {
  protected:
   void SetUp() override {
     previousPlatform_ = platform::setForTesting(&platform_);
-    char pattern[] = "/tmp/sorvik-failover-XXXXXX";
-    ASSERT_NE(::mkdtemp(pattern), nullptr);
-    dir_ = pattern;
-    oldDir_ = boost::filesystem::current_path();
-    boost::filesystem::current_path(dir_);
     host_ = std::make_unique<FakeHost>();
     host_->install();
     service_ = std::make_unique<UpdateService>(nullptr);
@@ -113,9 +109,6 @@ class FailoverTest : public ::testing::Test {
   void TearDown() override {
     service_.reset();
     host_.reset();
-    boost::filesystem::current_path(oldDir_);
-    boost::system::error_code ignored;
-    boost::filesystem::remove_all(dir_, ignored);
     platform::setForTesting(previousPlatform_);
   }
 
@@ -147,8 +140,7 @@ class FailoverTest : public ::testing::Test {
 
  private:
   platform::Platform* previousPlatform_ = nullptr;
-  boost::filesystem::path dir_;
-  boost::filesystem::path oldDir_;
+  ScopedTempCwd cwd_;
 };
 
 }  // namespace sorvik::testing

@@ -13,6 +13,7 @@
 #include "Sorvik/plugin/status_codes.h"
 #include "Sorvik/service/update_service.h"
 #include "host/fake_host.h"
+#include "host/test_temp_dir.h"
 
 namespace sorvik {
 namespace {
@@ -34,19 +35,11 @@ std::string failoverRequest(const std::string& state) {
 class ConfigurationIntakeTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    char pattern[] = "/tmp/sorvik-config-XXXXXX";
-    ASSERT_NE(::mkdtemp(pattern), nullptr);
-    dir_ = pattern;
-    oldDir_ = boost::filesystem::current_path();
-    boost::filesystem::current_path(dir_);
     host_.install();
     service_ = std::make_unique<UpdateService>(nullptr);
   }
   void TearDown() override {
     service_.reset();
-    boost::filesystem::current_path(oldDir_);
-    boost::system::error_code ignored;
-    boost::filesystem::remove_all(dir_, ignored);
   }
 
   void feed(const std::string& text) {
@@ -83,8 +76,7 @@ class ConfigurationIntakeTest : public ::testing::Test {
   std::unique_ptr<UpdateService> service_;
 
  private:
-  boost::filesystem::path dir_;
-  boost::filesystem::path oldDir_;
+  sorvik::testing::ScopedTempCwd cwd_;
 };
 
 enum class Outcome { Same, Decommission, Transition, Refuse };

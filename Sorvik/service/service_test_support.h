@@ -23,33 +23,12 @@
 #include "Sorvik/service/update_service.h"
 #include "Sorvik/service/worker_wait.h"
 #include "host/fake_host.h"
+#include "host/test_temp_dir.h"
 #include "host/test_watchdog.h"
 
 namespace sorvik::testing {
 
 inline constexpr std::chrono::seconds kTestDeadline{10};
-
-// Runs the test inside a fresh temporary directory.
-class ScopedTempCwd {
- public:
-  ScopedTempCwd() : previous_(boost::filesystem::current_path()) {
-    dir_ = boost::filesystem::temp_directory_path() / boost::filesystem::unique_path("sorvik-svc-%%%%-%%%%-%%%%");
-    boost::filesystem::create_directories(dir_);
-    boost::filesystem::current_path(dir_);
-  }
-  ~ScopedTempCwd() {
-    boost::system::error_code ignored;
-    boost::filesystem::current_path(previous_, ignored);
-    boost::filesystem::remove_all(dir_, ignored);
-  }
-  ScopedTempCwd(const ScopedTempCwd&) = delete;
-  ScopedTempCwd& operator=(const ScopedTempCwd&) = delete;
-  const boost::filesystem::path& path() const { return dir_; }
-
- private:
-  boost::filesystem::path previous_;
-  boost::filesystem::path dir_;
-};
 
 inline void writeFile(const std::string& path, const std::string& bytes) {
   const boost::filesystem::path p(path);

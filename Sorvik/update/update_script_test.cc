@@ -10,6 +10,8 @@
 
 #include <gtest/gtest.h>
 
+#include "host/test_temp_dir.h"
+
 #include <algorithm>
 #include <boost/filesystem.hpp>
 #include <cerrno>
@@ -36,9 +38,7 @@ void noteHangup(int) {
 class UpdateScriptTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    char pattern[] = "/tmp/sorvik-script-XXXXXX";
-    ASSERT_NE(::mkdtemp(pattern), nullptr);
-    dir_ = pattern;
+    dir_ = cwd_.path();
     ASSERT_EQ(::pipe2(hangupPipe, O_CLOEXEC | O_NONBLOCK), 0);
     struct sigaction action = {};
     action.sa_handler = noteHangup;
@@ -52,8 +52,6 @@ class UpdateScriptTest : public ::testing::Test {
     ::sigaction(SIGHUP, &oldAction_, nullptr);
     ::close(hangupPipe[0]);
     ::close(hangupPipe[1]);
-    boost::system::error_code ignored;
-    fs::remove_all(dir_, ignored);
   }
 
   static void write(const fs::path& path, const std::string& bytes) {
@@ -104,6 +102,7 @@ class UpdateScriptTest : public ::testing::Test {
     return true;
   }
 
+  testing::ScopedTempCwd cwd_;
   fs::path dir_;
   struct sigaction oldAction_ = {};
   testing::Watchdog watchdog_{std::chrono::seconds(60)};

@@ -24,6 +24,7 @@
 
 #include "Sorvik/service/update_service.h"
 #include "host/fake_host.h"
+#include "host/test_temp_dir.h"
 #include "host/test_watchdog.h"
 
 namespace sorvik::testing {
@@ -31,26 +32,18 @@ namespace sorvik::testing {
 class UpdateStepTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    char pattern[] = "/tmp/sorvik-update-XXXXXX";
-    ASSERT_NE(::mkdtemp(pattern), nullptr);
-    dir_ = boost::filesystem::canonical(pattern);
-    oldDir_ = boost::filesystem::current_path();
-    boost::filesystem::current_path(dir_);
-    boost::filesystem::create_directory(dir_ / "downloads");
+    boost::filesystem::create_directory(dir() / "downloads");
     host_ = std::make_unique<FakeHost>();
     host_->install();
     service_ = std::make_unique<UpdateService>(nullptr);
     MutexLock lock(&service_->stateMutex);
     service_->workerRunning = true;
-    service_->DownloadDir = (dir_ / "downloads").string();
+    service_->DownloadDir = (dir() / "downloads").string();
   }
 
   void TearDown() override {
     service_.reset();
     host_.reset();
-    boost::filesystem::current_path(oldDir_);
-    boost::system::error_code ignored;
-    boost::filesystem::remove_all(dir_, ignored);
   }
 
   static void writeFile(const boost::filesystem::path& path, const std::string& bytes) {
@@ -93,15 +86,14 @@ class UpdateStepTest : public ::testing::Test {
 
   UpdateService& service() { return *service_; }
   FakeHost& host() { return *host_; }
-  const boost::filesystem::path& dir() const { return dir_; }
+  const boost::filesystem::path& dir() const { return cwd_.path(); }
 
   Watchdog watchdog_;
   std::unique_ptr<FakeHost> host_;
   std::unique_ptr<UpdateService> service_;
 
  private:
-  boost::filesystem::path dir_;
-  boost::filesystem::path oldDir_;
+  ScopedTempCwd cwd_;
 };
 
 }  // namespace sorvik::testing
