@@ -14,13 +14,13 @@ if(_windows_tests)
   add_executable(sorvik_windows_tests ${_windows_tests})
   target_include_directories(sorvik_windows_tests PRIVATE ${PROJECT_SOURCE_DIR})
   target_link_libraries(sorvik_windows_tests PRIVATE
-    sorvik_service sorvik_platform sorvik_fake_host tinyxml_pkg GTest::gtest GTest::gtest_main)
+    sorvik_service sorvik_platform sorvik_fake_host sorvik_host_core tinyxml_pkg GTest::gtest GTest::gtest_main)
   gtest_discover_tests(sorvik_windows_tests DISCOVERY_TIMEOUT 60 PROPERTIES TIMEOUT 120)
 endif()
 
 if(TARGET sorvik_windows_tests)
-  add_executable(sorvik_windows_idle_child ${CMAKE_CURRENT_LIST_DIR}/windows_idle_child.cc)
-  add_dependencies(sorvik_windows_tests sorvik_windows_idle_child)
+  add_executable(sorvik_windows_test_child ${CMAKE_CURRENT_LIST_DIR}/windows_test_child.cc)
+  add_dependencies(sorvik_windows_tests sorvik_windows_test_child)
   target_compile_definitions(sorvik_windows_tests PRIVATE
-    SORVIK_IDLE_CHILD="$<TARGET_FILE_NAME:sorvik_windows_idle_child>")
+    SORVIK_TEST_CHILD="$<TARGET_FILE_NAME:sorvik_windows_test_child>")
 endif()

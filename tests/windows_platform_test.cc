@@ -167,13 +167,13 @@ fs::path besideThisExecutable(const char* name) {
   return fs::path(std::string(self, n)).parent_path() / name;
 }
 
-// A running copy of the idle child under a chosen file name.
+// A running copy of the test child under a chosen file name.
 class Child {
  public:
   Child(const fs::path& dir, const std::string& imageName) {
     fs::create_directories(dir);
     image_ = dir / imageName;
-    fs::copy_file(besideThisExecutable(SORVIK_IDLE_CHILD), image_, fs::copy_options::overwrite_existing);
+    fs::copy_file(besideThisExecutable(SORVIK_TEST_CHILD), image_, fs::copy_options::overwrite_existing);
     STARTUPINFOA si{};
     si.cb = sizeof(si);
     std::string cmd = "\"" + image_.string() + "\"";
