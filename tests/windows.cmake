@@ -20,7 +20,8 @@ endif()
 
 if(TARGET sorvik_windows_tests)
   add_executable(sorvik_windows_test_child ${CMAKE_CURRENT_LIST_DIR}/windows_test_child.cc)
-  add_dependencies(sorvik_windows_tests sorvik_windows_test_child)
+  add_dependencies(sorvik_windows_tests sorvik_windows_test_child sorvik kelp)
+  target_link_libraries(sorvik_windows_tests PRIVATE ws2_32)
   target_compile_definitions(sorvik_windows_tests PRIVATE
     SORVIK_TEST_CHILD="$<TARGET_FILE_NAME:sorvik_windows_test_child>")
 endif()
