@@ -57,6 +57,9 @@ if(SORVIK_BUILD_TESTS)
     # expect "/" between directory and bundle name; Windows joins with "\\".
     DownloadTest.FetchesWithCurlAndReportsEachProgressPiece
     JoinBundlePathTest.AddsASeparatorOnlyWhenMissing
+    # expects the download directory as "C:/...\\downloads"; it is resolved
+    # to the native form "C:\\...\\downloads".
+    WorkerTest.StartUpReportsEverythingInOrder
     # need a symbolic link that Boost resolves; Wine's links are not
     # reparse points, and Windows needs a privilege to make one.
     DownloadDirTest.ProtectsRootsTheCurrentDirectoryAndItsAncestors)

@@ -25,3 +25,15 @@ if(TARGET sorvik_windows_tests)
   target_compile_definitions(sorvik_windows_tests PRIVATE
     SORVIK_TEST_CHILD="$<TARGET_FILE_NAME:sorvik_windows_test_child>")
 endif()
+
+# sorvik-host.exe end to end: loads the DLL, runs a script, exits 0.
+if(TARGET sorvik-host)
+  set(_smoke ${CMAKE_BINARY_DIR}/windows-host-smoke)
+  file(MAKE_DIRECTORY ${_smoke})
+  file(WRITE ${_smoke}/script.txt
+    "wait FailbackStatus\nfailover COMMISSIONED\nwait NOT_PERMITTED\nquit\n")
+  add_test(NAME sorvik_host_exe_runs_a_script
+    COMMAND sorvik-host --child-output null -s script.txt -C . ../bin/sorvik.dll
+    WORKING_DIRECTORY ${_smoke})
+  set_tests_properties(sorvik_host_exe_runs_a_script PROPERTIES TIMEOUT 60)
+endif()
