@@ -72,3 +72,23 @@ if(SORVIK_BUILD_TESTS)
     COMMAND ${CMAKE_COMMAND} -DDLL=$<TARGET_FILE:sorvik> -DOBJDUMP=${CMAKE_OBJDUMP}
             -P ${PROJECT_SOURCE_DIR}/cmake/WindowsCheckDll.cmake)
 endif()
+
+# The Windows package, staged in package/: the plug-in, the sample scripts,
+# the reference agent and the development host. Debug information stays
+# in the build tree's copies.
+set(_package ${CMAKE_BINARY_DIR}/package)
+set(_package_steps
+  COMMAND ${CMAKE_COMMAND} -E rm -rf ${_package}
+  COMMAND ${CMAKE_COMMAND} -E make_directory ${_package}/scripts
+  # PowerShell samples; scripts/ holds the POSIX host's /bin/sh stand-ins.
+  COMMAND ${CMAKE_COMMAND} -E copy_directory ${PROJECT_SOURCE_DIR}/tools/windows-scripts ${_package}/scripts)
+set(_package_deps sorvik)
+foreach(_program sorvik kelp sorvik-host)
+  if(TARGET ${_program})
+    list(APPEND _package_deps ${_program})
+    list(APPEND _package_steps
+      COMMAND ${CMAKE_COMMAND} -E copy $<TARGET_FILE:${_program}> ${_package}/
+      COMMAND ${CMAKE_STRIP} --strip-debug ${_package}/$<TARGET_FILE_NAME:${_program}>)
+  endif()
+endforeach()
+add_custom_target(windows_package ALL ${_package_steps} DEPENDS ${_package_deps} VERBATIM)
