@@ -65,9 +65,12 @@ int resolveWindowsProgram(const std::string& program, const std::string& directo
   if (program.empty()) return ENOENT;
   const bool absolute = program.size() > 1 && (program[1] == ':' || (program[0] == '\\' && program[1] == '\\'));
   const bool hasDirectory = program.find_first_of("/\\") != std::string::npos;
-  std::string candidate = program;
+  std::string relative = program;
+  std::replace(relative.begin(), relative.end(), '/', '\\');
+  while (relative.rfind(".\\", 0) == 0) relative.erase(0, 2);
+  std::string candidate = absolute ? relative : program;
   if (!absolute && (hasDirectory || !directory.empty())) {
-    candidate = (directory.empty() ? std::string(".") : directory) + "\\" + program;
+    candidate = (directory.empty() ? std::string(".") : directory) + "\\" + relative;
   }
   std::replace(candidate.begin(), candidate.end(), '/', '\\');
   if (fileExists(candidate)) {

@@ -10,6 +10,9 @@ list(APPEND _defs "SORVIK_PLUGIN_PATH=\"sorvik.dll\"")
 set_target_properties(sorvik_entry_points_tests PROPERTIES COMPILE_DEFINITIONS "${_defs}")
 
 file(GLOB _windows_tests CONFIGURE_DEPENDS ${CMAKE_CURRENT_LIST_DIR}/windows_*_test.cc)
+# The failback session stops every kelp.exe by name: it runs alone.
+set(_windows_session_test ${CMAKE_CURRENT_LIST_DIR}/windows_failback_session_test.cc)
+list(REMOVE_ITEM _windows_tests ${_windows_session_test})
 if(_windows_tests)
   add_executable(sorvik_windows_tests ${_windows_tests})
   target_include_directories(sorvik_windows_tests PRIVATE ${PROJECT_SOURCE_DIR})
@@ -18,13 +21,23 @@ if(_windows_tests)
   gtest_discover_tests(sorvik_windows_tests DISCOVERY_TIMEOUT 60 PROPERTIES TIMEOUT 120)
 endif()
 
-if(TARGET sorvik_windows_tests)
-  add_executable(sorvik_windows_test_child ${CMAKE_CURRENT_LIST_DIR}/windows_test_child.cc)
-  add_dependencies(sorvik_windows_tests sorvik_windows_test_child sorvik kelp)
-  target_link_libraries(sorvik_windows_tests PRIVATE ws2_32)
-  target_compile_definitions(sorvik_windows_tests PRIVATE
-    SORVIK_TEST_CHILD="$<TARGET_FILE_NAME:sorvik_windows_test_child>")
+if(EXISTS ${_windows_session_test})
+  add_executable(sorvik_windows_session_tests ${_windows_session_test})
+  target_include_directories(sorvik_windows_session_tests PRIVATE ${PROJECT_SOURCE_DIR})
+  target_link_libraries(sorvik_windows_session_tests PRIVATE
+    sorvik_platform sorvik_host_core tinyxml_pkg ws2_32 GTest::gtest GTest::gtest_main)
+  add_dependencies(sorvik_windows_session_tests sorvik kelp)
+  gtest_discover_tests(sorvik_windows_session_tests DISCOVERY_TIMEOUT 60
+    PROPERTIES TIMEOUT 120 RUN_SERIAL TRUE)
 endif()
+
+add_executable(sorvik_windows_test_child ${CMAKE_CURRENT_LIST_DIR}/windows_test_child.cc)
+foreach(_t sorvik_windows_tests sorvik_windows_session_tests)
+  if(TARGET ${_t})
+    add_dependencies(${_t} sorvik_windows_test_child)
+    target_compile_definitions(${_t} PRIVATE SORVIK_TEST_CHILD="$<TARGET_FILE_NAME:sorvik_windows_test_child>")
+  endif()
+endforeach()
 
 # sorvik-host.exe end to end: loads the DLL, runs a script, exits 0.
 if(TARGET sorvik-host)

@@ -103,6 +103,8 @@ class OwnProcess {
 class WindowsFailbackSessionTest : public ::testing::Test {
  protected:
   void SetUp() override {
+    // This test stops agents by their real name (it runs alone).
+    ::_putenv_s("SORVIK_AGENT_IMAGE_NAME", "");
     dir_ = fs::temp_directory_path() / ("sorvik-failback-" + std::to_string(::GetCurrentProcessId()));
     fs::remove_all(dir_);
     fs::create_directories(dir_ / "scripts");

@@ -7,6 +7,7 @@
 #include <gtest/gtest.h>
 
 #include <cerrno>
+#include <cstdlib>
 #include <filesystem>
 #include <algorithm>
 #include <fstream>
@@ -156,7 +157,13 @@ TEST_F(WindowsPlatformTest, StateFileSaveSurvivesAHeldDestination) {
 }
 
 TEST(WindowsNamesTest, PlatformNames) {
+  const char* override = std::getenv("SORVIK_AGENT_IMAGE_NAME");
+  const std::string saved = override != nullptr ? override : "";
+  ::_putenv_s("SORVIK_AGENT_IMAGE_NAME", "");
   EXPECT_EQ(native().agentImageName(), "kelp.exe");
+  ::_putenv_s("SORVIK_AGENT_IMAGE_NAME", "kelp-of-this-run.exe");
+  EXPECT_EQ(native().agentImageName(), "kelp-of-this-run.exe");
+  ::_putenv_s("SORVIK_AGENT_IMAGE_NAME", saved.c_str());
   EXPECT_STREQ(sorvik::platform::packageTypeName(), "windows-x64");
   EXPECT_STREQ(sorvik::platform::pathSeparator(), "\\");
 }

@@ -187,5 +187,37 @@ TEST(WindowsCommandLineTest, QuotesOnlyWhatNeedsIt) {
   EXPECT_TRUE(ps1InterpreterArguments("stub.exe").empty());
 }
 
+TEST(WindowsCommandLineTest, ResolvesProgramsLikeTheHostPromises) {
+  char temp[MAX_PATH];
+  const std::string dir = std::string(temp, ::GetTempPathA(sizeof temp, temp)) + "sorvik-resolve-" +
+                          std::to_string(::GetCurrentProcessId());
+  ::CreateDirectoryA(dir.c_str(), nullptr);
+  ::CreateDirectoryA((dir + "\\scripts").c_str(), nullptr);
+  for (const std::string name : {"\\kelp.exe", "\\scripts\\update.ps1"}) {
+    ::CloseHandle(::CreateFileA((dir + name).c_str(), GENERIC_WRITE, 0, nullptr, CREATE_ALWAYS, 0, nullptr));
+  }
+  std::string path;
+  EXPECT_EQ(resolveWindowsProgram("./kelp", dir, &path), 0);
+  EXPECT_EQ(path, dir + "\\kelp.exe");
+  EXPECT_EQ(resolveWindowsProgram("scripts/update.ps1", dir, &path), 0);
+  EXPECT_EQ(path, dir + "\\scripts\\update.ps1");
+  EXPECT_EQ(resolveWindowsProgram("./curl", dir, &path), ENOENT);
+  EXPECT_EQ(resolveWindowsProgram("cmd", dir, &path), 0);
+  EXPECT_EQ(path, "cmd");  // left to CreateProcess's search
+  ::DeleteFileA((dir + "\\kelp.exe").c_str());
+  ::DeleteFileA((dir + "\\scripts\\update.ps1").c_str());
+  ::RemoveDirectoryA((dir + "\\scripts").c_str());
+  ::RemoveDirectoryA(dir.c_str());
+
+  ::SetEnvironmentVariableA("SORVIK_BLOCK_TEST", "old");
+  const std::string block = windowsEnvironmentBlock({"sorvik_block_test=new", "SORVIK_HOST_PID=42", "junk"});
+  EXPECT_NE(block.find(std::string("sorvik_block_test=new\0", 22)), std::string::npos);
+  EXPECT_EQ(block.find("SORVIK_BLOCK_TEST=old"), std::string::npos);
+  EXPECT_NE(block.find(std::string("SORVIK_HOST_PID=42\0", 19)), std::string::npos);
+  EXPECT_EQ(block.find("junk"), std::string::npos);
+  EXPECT_EQ(block.substr(block.size() - 2), std::string(2, '\0'));
+  ::SetEnvironmentVariableA("SORVIK_BLOCK_TEST", nullptr);
+}
+
 }  // namespace
 }  // namespace sorvik::host

@@ -16,6 +16,10 @@ export WINEDEBUG=${WINEDEBUG:--all}
 # No Mono or Gecko installer prompts; nothing here needs them.
 export WINEDLLOVERRIDES=${WINEDLLOVERRIDES:-mscoree,mshtml=}
 export WINEARCH=win64
+# Every test shares the prefix's one process table, and closing the plug-in
+# stops every process with the agent's image name. Tests get a name no real
+# agent has; a test that runs kelp.exe itself clears it and runs alone.
+export SORVIK_AGENT_IMAGE_NAME=${SORVIK_AGENT_IMAGE_NAME-sorvik-tests-no-agent.exe}
 wine=${SORVIK_WINE:-/usr/lib/wine/wine64}
 wineserver=${SORVIK_WINESERVER:-/usr/lib/wine/wineserver64}
 
