@@ -54,6 +54,8 @@ clean:
 # Third-party sources and the Wine prefix live in WINDOWS_CACHE, outside git.
 WINDOWS_CACHE ?= $(HOME)/.cache/sorvik-windows
 WINDOWS_BUILD ?= build-win
+# Release: no debug information to compile and link keeps CI short.
+WINDOWS_BUILD_TYPE ?= Release
 
 .PHONY: windows test-windows
 
@@ -61,7 +63,7 @@ windows:
 	@bash tools/install-windows-deps.sh
 	@bash tools/fetch-windows-sources.sh $(WINDOWS_CACHE)
 	$(CMAKE_GEN) -S . -B $(WINDOWS_BUILD) -DCMAKE_TOOLCHAIN_FILE=cmake/mingw-w64-toolchain.cmake \
-	  -DCMAKE_BUILD_TYPE=RelWithDebInfo -DSORVIK_BUILD_BENCH=OFF \
+	  -DCMAKE_BUILD_TYPE=$(WINDOWS_BUILD_TYPE) -DSORVIK_BUILD_BENCH=OFF \
 	  -DSORVIK_WINDOWS_SOURCES=$(WINDOWS_CACHE)/src
 	cmake --build $(WINDOWS_BUILD) -j $(JOBS)
 
