@@ -1,4 +1,7 @@
 # Windows-only tests and the Windows side of the shared plug-in test.
+if(NOT WIN32)
+  return()
+endif()
 
 # The entry-point test loads the plug-in through <dlfcn.h>; here that is a
 # thin layer over LoadLibrary, and the DLL is found beside the test
