@@ -53,3 +53,12 @@ if(TARGET sorvik-host)
     WORKING_DIRECTORY ${_smoke})
   set_tests_properties(sorvik_host_exe_runs_a_script PROPERTIES TIMEOUT 60)
 endif()
+
+# The host's platform-neutral tests (script language, documents, display)
+# run against the Windows build of the shared host code too.
+if(EXISTS ${CMAKE_CURRENT_LIST_DIR}/host_script_test.cc)
+  add_executable(sorvik_host_script_tests ${CMAKE_CURRENT_LIST_DIR}/host_script_test.cc)
+  target_include_directories(sorvik_host_script_tests PRIVATE ${PROJECT_SOURCE_DIR})
+  target_link_libraries(sorvik_host_script_tests PRIVATE sorvik_host_core tinyxml_pkg GTest::gtest GTest::gtest_main)
+  gtest_discover_tests(sorvik_host_script_tests DISCOVERY_TIMEOUT 60 PROPERTIES TIMEOUT 120)
+endif()

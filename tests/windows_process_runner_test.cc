@@ -149,6 +149,55 @@ TEST_F(WindowsRunnerTest, PipedChildGetsItsArgumentsAndInputAndReportsOutputAndE
   EXPECT_EQ(runner_->childCount(), 0u);
 }
 
+TEST_F(WindowsRunnerTest, LongInputInFullSizeChunksArrivesWholeBeforeTheClose) {
+  start(6, {testChildPath(), "--echo"});
+  Received started;
+  ASSERT_TRUE(inbox_.waitFor(6, PacketType::Started, &started));
+  // Every chunk of a long send carries the close bit; only the last is short.
+  const std::string full(ko::ipc::kMaxPacketPayload, 'a');
+  submit(packet(6, PacketType::StdinData, ko::ipc::kStdinClose, full));
+  submit(packet(6, PacketType::StdinData, ko::ipc::kStdinClose, full));
+  submit(packet(6, PacketType::StdinData, ko::ipc::kStdinClose, "end"));
+  Received exited;
+  ASSERT_TRUE(inbox_.waitFor(6, PacketType::Exited, &exited));
+  EXPECT_EQ(inbox_.output(6, PacketType::StdoutData), full + full + "end");
+}
+
+TEST_F(WindowsRunnerTest, DetachedChildrenAreForgottenButNoticed) {
+  std::vector<std::string> notices;
+  Mutex noticeMu;
+  runner_->stop();
+  runner_ = newProcessRunner(
+      RunnerOptions{}, [this](const unsigned char* p, size_t n) { inbox_.add(p, n); },
+      [&](const std::string& text) {
+        MutexLock lock(&noticeMu);
+        notices.push_back(text);
+      });
+  std::string error;
+  ASSERT_TRUE(runner_->start(&error));
+  start(8, {testChildPath()});
+  Received started;
+  ASSERT_TRUE(inbox_.waitFor(8, PacketType::Started, &started));
+  runner_->detachAll();
+  EXPECT_EQ(runner_->childCount(), 1u);
+
+  HANDLE child = ::OpenProcess(PROCESS_TERMINATE | SYNCHRONIZE, FALSE, started.value);
+  ASSERT_NE(child, nullptr);
+  ::TerminateProcess(child, 9);
+  ::WaitForSingleObject(child, 10000);
+  ::CloseHandle(child);
+  // The runner hears of the end on its own thread; a flush after that is
+  // not ordered with it, so wait for the count with a deadline.
+  const auto deadline = std::chrono::steady_clock::now() + 10s;
+  while (runner_->childCount() != 0 && std::chrono::steady_clock::now() < deadline) runner_->flush();
+  EXPECT_EQ(runner_->childCount(), 0u);
+  runner_->stop();
+  EXPECT_EQ(inbox_.types(8), std::vector<PacketType>{PacketType::Started});
+  MutexLock lock(&noticeMu);
+  ASSERT_FALSE(notices.empty());
+  EXPECT_EQ(notices.back(), "runner: detached child pid " + std::to_string(started.value) + " exited with code 9");
+}
+
 TEST_F(WindowsRunnerTest, StartFailuresCarryAnErrnoValue) {
   start(1, {"./no-such-program"});
   Received failed;
