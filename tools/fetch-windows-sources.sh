@@ -9,13 +9,26 @@ cache=${1:-${SORVIK_WINDOWS_CACHE:-$HOME/.cache/sorvik-windows}}
 src="$cache/src"
 mkdir -p "$src"
 
-# Runs apt-get source in a scratch directory and leaves the files there.
+sudo=""
+[ "$(id -u)" -eq 0 ] || sudo="sudo"
+
+# Runs apt-get source in a scratch directory and leaves the files there;
+# refreshes the package lists once when the source package is unknown.
 download() {
-  local work=$1; shift
+  local work=$1 name=$2
   rm -rf "$work" && mkdir -p "$work"
   # apt drops privileges to _apt for downloads; let it write here.
   chmod 777 "$work"
-  (cd "$work" && apt-get source --download-only -qq "$@" 2>&1 | grep -v '^W: Download is performed unsandboxed' || true)
+  local attempt
+  for attempt in 1 2; do
+    if (cd "$work" && apt-get source --download-only -qq "$name" 2>&1 |
+          grep -v '^W: Download is performed unsandboxed'; exit "${PIPESTATUS[0]}"); then
+      return 0
+    fi
+    [ "$attempt" -eq 1 ] && $sudo apt-get update -qq
+  done
+  echo "fetch-windows-sources: cannot fetch the source package $name" >&2
+  exit 1
 }
 
 unpack_dsc() {
