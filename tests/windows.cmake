@@ -37,13 +37,14 @@ endif()
 add_executable(sorvik_windows_test_child ${CMAKE_CURRENT_LIST_DIR}/windows_test_child.cc)
 foreach(_t sorvik_windows_tests sorvik_windows_session_tests)
   if(TARGET ${_t})
-    add_dependencies(${_t} sorvik_windows_test_child)
+    add_dependencies(${_t} sorvik_windows_test_child sorvik)
     target_compile_definitions(${_t} PRIVATE SORVIK_TEST_CHILD="$<TARGET_FILE_NAME:sorvik_windows_test_child>")
   endif()
 endforeach()
 
 # sorvik-host.exe end to end: loads the DLL, runs a script, exits 0.
 if(TARGET sorvik-host)
+  add_dependencies(sorvik_windows_tests sorvik-host)
   set(_smoke ${CMAKE_BINARY_DIR}/windows-host-smoke)
   file(MAKE_DIRECTORY ${_smoke})
   file(WRITE ${_smoke}/script.txt
