@@ -42,17 +42,9 @@ foreach(_t sorvik_windows_tests sorvik_windows_session_tests)
   endif()
 endforeach()
 
-# sorvik-host.exe end to end: loads the DLL, runs a script, exits 0.
+# WindowsHostExeTest runs sorvik-host.exe from beside the test executable.
 if(TARGET sorvik-host)
   add_dependencies(sorvik_windows_tests sorvik-host)
-  set(_smoke ${CMAKE_BINARY_DIR}/windows-host-smoke)
-  file(MAKE_DIRECTORY ${_smoke})
-  file(WRITE ${_smoke}/script.txt
-    "wait FailbackStatus\nfailover COMMISSIONED\nwait NOT_PERMITTED\nquit\n")
-  add_test(NAME sorvik_host_exe_runs_a_script
-    COMMAND sorvik-host --child-output null -s script.txt -C . ../bin/sorvik.dll
-    WORKING_DIRECTORY ${_smoke})
-  set_tests_properties(sorvik_host_exe_runs_a_script PROPERTIES TIMEOUT 60)
 endif()
 
 # The host's platform-neutral tests (script language, documents, display)
