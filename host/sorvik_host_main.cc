@@ -14,6 +14,7 @@
 #include <thread>
 
 #include "host/posix_console.h"
+#include "host/sorvik_host_cli.h"
 #include "host/sorvik_host_display.h"
 #include "host/sorvik_host_events.h"
 #include "host/sorvik_host_script.h"
@@ -21,11 +22,6 @@
 
 namespace sorvik::host {
 namespace {
-
-constexpr int kExitOk = 0;
-constexpr int kExitScriptFailed = 1;
-constexpr int kExitUsage = 2;
-constexpr int kExitStartFailed = 3;
 
 const char kUsage[] = R"(Usage: sorvik-host [OPTIONS] PLUGIN_LIBRARY
 
@@ -70,82 +66,6 @@ bad instruction); 2 bad command line; 3 the plug-in or the working directory
 could not be loaded. A child ended by signal N is reported to the plug-in
 with exit code 128+N.
 )";
-
-struct Options {
-  std::string library;
-  std::string workdir;
-  std::string script;
-  int32_t logLevel = 25;
-  double waitSeconds = 30;
-  std::string ps1Interpreter = "/bin/sh";
-  bool inheritChildOutput = true;
-};
-
-void printUsage(std::FILE* out) { std::fprintf(out, kUsage, instructionHelp()); }
-
-int missingValue(const std::string& option) {
-  std::fprintf(stderr, "sorvik-host: %s needs a value (see --help)\n", option.c_str());
-  return kExitUsage;
-}
-
-// 0 to run, otherwise the exit code (help shown, or an error printed).
-int parseOptions(int argc, char** argv, Options* options, bool* helpShown) {
-  *helpShown = false;
-  for (int i = 1; i < argc; ++i) {
-    const std::string arg = argv[i];
-    auto value = [&](std::string* out) {
-      if (i + 1 >= argc) return false;
-      *out = argv[++i];
-      return true;
-    };
-    std::string text;
-    if (arg == "-h" || arg == "--help") {
-      printUsage(stdout);
-      *helpShown = true;
-      return kExitOk;
-    } else if (arg == "-C" || arg == "--workdir") {
-      if (!value(&options->workdir)) return missingValue(arg);
-    } else if (arg == "-s" || arg == "--script") {
-      if (!value(&options->script)) return missingValue(arg);
-    } else if (arg == "-l" || arg == "--log-level") {
-      if (!value(&text)) return missingValue(arg);
-      if (!parseLogLevel(text, &options->logLevel)) {
-        std::fprintf(stderr, "sorvik-host: bad log level '%s'\n", text.c_str());
-        return kExitUsage;
-      }
-    } else if (arg == "-w" || arg == "--wait-timeout") {
-      if (!value(&text)) return missingValue(arg);
-      char* end = nullptr;
-      options->waitSeconds = std::strtod(text.c_str(), &end);
-      if (text.empty() || *end != '\0' || !(options->waitSeconds >= 0)) {
-        std::fprintf(stderr, "sorvik-host: bad wait timeout '%s'\n", text.c_str());
-        return kExitUsage;
-      }
-    } else if (arg == "--ps1-interpreter") {
-      if (!value(&options->ps1Interpreter)) return missingValue(arg);
-    } else if (arg == "--child-output") {
-      if (!value(&text)) return missingValue(arg);
-      if (text != "inherit" && text != "null") {
-        std::fprintf(stderr, "sorvik-host: --child-output takes inherit or null\n");
-        return kExitUsage;
-      }
-      options->inheritChildOutput = text == "inherit";
-    } else if (!arg.empty() && arg[0] == '-') {
-      std::fprintf(stderr, "sorvik-host: unknown option %s (see --help)\n", arg.c_str());
-      return kExitUsage;
-    } else if (options->library.empty()) {
-      options->library = arg;
-    } else {
-      std::fprintf(stderr, "sorvik-host: more than one plug-in library given\n");
-      return kExitUsage;
-    }
-  }
-  if (options->library.empty()) {
-    std::fprintf(stderr, "sorvik-host: missing PLUGIN_LIBRARY (see --help)\n");
-    return kExitUsage;
-  }
-  return kExitOk;
-}
 
 std::string absolute(const std::string& path) {
   char resolved[PATH_MAX];
@@ -217,32 +137,10 @@ int run(const Options& options) {
   ScriptRunner runner(&session, &events, &display,
                       std::chrono::milliseconds(static_cast<int64_t>(options.waitSeconds * 1000)));
   LineReader reader(scriptFd, stopInput.fd());
-  int exitCode = kExitOk;
-  int lineNumber = 0;
-  std::string line;
-  while (true) {
-    if (interactive) display.prompt("sorvik> ");
-    const ReadResult read = reader.next(&line);
-    if (interactive) display.prompt("");
-    if (read != ReadResult::Line) break;
-    ++lineNumber;
-    const size_t first = line.find_first_not_of(" \t\r");
-    if (first == std::string::npos || line[first] == '#') continue;
-    if (!interactive) display.say("> " + maskInstruction(line.substr(first)));
-    std::string why;
-    const StepResult result = runner.execute(line, &why);
-    if (result == StepResult::Quit) break;
-    if (result == StepResult::Failed) {
-      if (interactive) {
-        display.say("error: " + why);
-        continue;
-      }
-      const std::string where = options.script.empty() ? "stdin" : options.script;
-      display.say("sorvik-host: script failed at " + where + ":" + std::to_string(lineNumber) + ": " + why);
-      exitCode = kExitScriptFailed;
-      break;
-    }
-  }
+  const int exitCode = runInstructions(
+      runner, display,
+      [&](std::string* line) { return reader.next(line) == ReadResult::Line; }, interactive,
+      options.script.empty() ? "stdin" : options.script);
   stopControl.raise();
   control.join();
   session.shutdown();
@@ -255,8 +153,9 @@ int run(const Options& options) {
 
 int main(int argc, char** argv) {
   sorvik::host::Options options;
+  options.ps1Interpreter = "/bin/sh";
   bool helpShown = false;
-  const int rc = sorvik::host::parseOptions(argc, argv, &options, &helpShown);
+  const int rc = sorvik::host::parseOptions(argc, argv, sorvik::host::kUsage, &options, &helpShown);
   if (rc != 0 || helpShown) return rc;
   return sorvik::host::run(options);
 }
