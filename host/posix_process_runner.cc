@@ -227,25 +227,12 @@ class PosixProcessRunner final : public ProcessRunner {
   }
 
   void handlePacket(const std::string& bytes) {
-    ko::ipc::PacketHeader header;
-    const auto* raw = reinterpret_cast<const unsigned char*>(bytes.data());
-    if (!ko::ipc::decodePacketHeader(raw, bytes.size(), &header)) {
-      notice_("runner: dropped a packet shorter than its header (" + std::to_string(bytes.size()) + " bytes)");
-      return;
-    }
-    const unsigned char* payload = raw + ko::ipc::kPacketHeaderSize;
-    const size_t payloadLength = bytes.size() - ko::ipc::kPacketHeaderSize;
-    switch (static_cast<PacketType>(header.type)) {
-      case PacketType::StartRequest:
-        startChild(header, payload, payloadLength);
-        return;
-      case PacketType::StdinData:
-        queueStdin(header, bytes.size(), payload, payloadLength);
-        return;
-      default:
-        notice_("runner: dropped a packet of unexpected type " + std::to_string(header.type) + " for id " +
-                std::to_string(header.id));
-    }
+    dispatchPluginPacket(bytes, notice_,
+                         {[this](const auto& header, const unsigned char* payload, size_t length) {
+                            startChild(header, payload, length);
+                          },
+                          [this](const auto& header, size_t packetLength, const unsigned char* payload,
+                                 size_t length) { queueStdin(header, packetLength, payload, length); }});
   }
 
   void startChild(const ko::ipc::PacketHeader& header, const unsigned char* payload, size_t length) {
@@ -293,13 +280,15 @@ class PosixProcessRunner final : public ProcessRunner {
     if (child == nullptr || child->stdinFd < 0) return;
     if (length != 0) child->stdinQueue.emplace_back(reinterpret_cast<const char*>(payload), length);
     child->closeDeadline = Clock::time_point::max();
-    if ((header.value & ko::ipc::kStdinClose) == 0) return;
-    // Every chunk of a long send repeats the close bit, so a full-size chunk
-    // may be followed by more: close only after a short quiet period.
-    if (packetLength >= ko::ipc::kMaxPacketSize) {
-      child->closeDeadline = Clock::now() + std::chrono::milliseconds(options_.closeGraceMs);
-    } else {
-      child->closeWhenDrained = true;
+    switch (stdinCloseFor(header.value, packetLength)) {
+      case StdinClose::Keep:
+        return;
+      case StdinClose::AfterQuietPeriod:
+        child->closeDeadline = Clock::now() + std::chrono::milliseconds(options_.closeGraceMs);
+        return;
+      case StdinClose::WhenDrained:
+        child->closeWhenDrained = true;
+        return;
     }
   }
 

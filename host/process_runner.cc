@@ -32,4 +32,31 @@ bool decodeStartPayload(const unsigned char* data, size_t length, uint32_t flags
   return true;
 }
 
+StdinClose stdinCloseFor(uint32_t value, size_t packetLength) {
+  if ((value & ko::ipc::kStdinClose) == 0) return StdinClose::Keep;
+  return packetLength >= ko::ipc::kMaxPacketSize ? StdinClose::AfterQuietPeriod : StdinClose::WhenDrained;
+}
+
+void dispatchPluginPacket(const std::string& bytes, const RunnerNotice& notice, const PluginPacketHandlers& handlers) {
+  ko::ipc::PacketHeader header;
+  const auto* raw = reinterpret_cast<const unsigned char*>(bytes.data());
+  if (!ko::ipc::decodePacketHeader(raw, bytes.size(), &header)) {
+    notice("runner: dropped a packet shorter than its header (" + std::to_string(bytes.size()) + " bytes)");
+    return;
+  }
+  const unsigned char* payload = raw + ko::ipc::kPacketHeaderSize;
+  const size_t payloadLength = bytes.size() - ko::ipc::kPacketHeaderSize;
+  switch (static_cast<ko::ipc::PacketType>(header.type)) {
+    case ko::ipc::PacketType::StartRequest:
+      handlers.start(header, payload, payloadLength);
+      return;
+    case ko::ipc::PacketType::StdinData:
+      handlers.stdinData(header, bytes.size(), payload, payloadLength);
+      return;
+    default:
+      notice("runner: dropped a packet of unexpected type " + std::to_string(header.type) + " for id " +
+             std::to_string(header.id));
+  }
+}
+
 }  // namespace sorvik::host

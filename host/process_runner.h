@@ -15,6 +15,8 @@
 #include <string>
 #include <vector>
 
+#include "Sorvik/ipc/packet.h"
+
 namespace sorvik::host {
 
 struct RunnerOptions {
@@ -48,6 +50,22 @@ struct StartPayload {
 };
 // False when the payload lacks a text its flags announce or has no program.
 bool decodeStartPayload(const unsigned char* data, size_t length, uint32_t flags, StartPayload* out);
+
+// What a StdinData packet asks of the child's input once its bytes are
+// written. Every chunk of a long send repeats the close bit, so a full-size
+// chunk may be followed by more: its close waits for a short quiet period.
+enum class StdinClose { Keep, WhenDrained, AfterQuietPeriod };
+StdinClose stdinCloseFor(uint32_t value, size_t packetLength);
+
+// Decodes one packet the plug-in sent and hands a start request or standard
+// input to its handler; anything else is reported through `notice`.
+struct PluginPacketHandlers {
+  std::function<void(const ko::ipc::PacketHeader& header, const unsigned char* payload, size_t length)> start;
+  std::function<void(const ko::ipc::PacketHeader& header, size_t packetLength, const unsigned char* payload,
+                     size_t length)>
+      stdinData;
+};
+void dispatchPluginPacket(const std::string& bytes, const RunnerNotice& notice, const PluginPacketHandlers& handlers);
 
 // The exit code the runner reports for a child ended by `signal`.
 inline int32_t exitCodeForSignal(int signal) { return 128 + signal; }

@@ -460,25 +460,12 @@ class WindowsProcessRunner final : public ProcessRunner {
   }
 
   void handlePacket(const std::string& bytes) {
-    ko::ipc::PacketHeader header;
-    const auto* raw = reinterpret_cast<const unsigned char*>(bytes.data());
-    if (!ko::ipc::decodePacketHeader(raw, bytes.size(), &header)) {
-      notice_("runner: dropped a packet shorter than its header (" + std::to_string(bytes.size()) + " bytes)");
-      return;
-    }
-    const unsigned char* payload = raw + ko::ipc::kPacketHeaderSize;
-    const size_t payloadLength = bytes.size() - ko::ipc::kPacketHeaderSize;
-    switch (static_cast<PacketType>(header.type)) {
-      case PacketType::StartRequest:
-        startChild(header, payload, payloadLength);
-        return;
-      case PacketType::StdinData:
-        queueStdin(header, bytes.size(), payload, payloadLength);
-        return;
-      default:
-        notice_("runner: dropped a packet of unexpected type " + std::to_string(header.type) + " for id " +
-                std::to_string(header.id));
-    }
+    dispatchPluginPacket(bytes, notice_,
+                         {[this](const auto& header, const unsigned char* payload, size_t length) {
+                            startChild(header, payload, length);
+                          },
+                          [this](const auto& header, size_t packetLength, const unsigned char* payload,
+                                 size_t length) { queueStdin(header, packetLength, payload, length); }});
   }
 
   void queueStdin(const ko::ipc::PacketHeader& header, size_t packetLength, const unsigned char* payload,
@@ -487,13 +474,15 @@ class WindowsProcessRunner final : public ProcessRunner {
     // A child that has ended or has no pipe simply loses the bytes.
     if (child == nullptr || !child->stdinWriter) return;
     child->stdinWriter->send(std::string(reinterpret_cast<const char*>(payload), length));
-    if ((header.value & ko::ipc::kStdinClose) == 0) return;
-    // Every chunk of a long send repeats the close bit, so a full-size chunk
-    // may be followed by more: close only after a short quiet period.
-    if (packetLength >= ko::ipc::kMaxPacketSize) {
-      child->stdinWriter->closeAfter(Clock::now() + std::chrono::milliseconds(options_.closeGraceMs));
-    } else {
-      child->stdinWriter->closeWhenDrained();
+    switch (stdinCloseFor(header.value, packetLength)) {
+      case StdinClose::Keep:
+        return;
+      case StdinClose::AfterQuietPeriod:
+        child->stdinWriter->closeAfter(Clock::now() + std::chrono::milliseconds(options_.closeGraceMs));
+        return;
+      case StdinClose::WhenDrained:
+        child->stdinWriter->closeWhenDrained();
+        return;
     }
   }
 
