@@ -24,6 +24,7 @@
 #include "host/sorvik_host_documents.h"
 #include "host/sorvik_host_events.h"
 #include "host/sorvik_host_session.h"
+#include "tests/windows_test_process.h"
 
 namespace sorvik::host {
 namespace {
@@ -69,36 +70,6 @@ std::string askAgent(int port, const std::string& token) {
   ::WSACleanup();
   return answer;
 }
-
-// A process the test starts itself, whose image has a chosen name.
-class OwnProcess {
- public:
-  OwnProcess(const fs::path& image) {
-    std::string cmd = "\"" + image.string() + "\"";
-    STARTUPINFOA si{};
-    si.cb = sizeof si;
-    ok_ = ::CreateProcessA(nullptr, cmd.data(), nullptr, nullptr, FALSE, 0, nullptr, nullptr, &si, &pi_) != 0;
-    if (ok_) ::CloseHandle(pi_.hThread);
-  }
-  ~OwnProcess() {
-    if (!ok_) return;
-    ::TerminateProcess(pi_.hProcess, 99);
-    ::WaitForSingleObject(pi_.hProcess, 10000);
-    ::CloseHandle(pi_.hProcess);
-  }
-  bool ok() const { return ok_; }
-  uint32_t pid() const { return pi_.dwProcessId; }
-  long exitCode() const {
-    if (::WaitForSingleObject(pi_.hProcess, 10000) != WAIT_OBJECT_0) return -1;
-    DWORD code = 0;
-    ::GetExitCodeProcess(pi_.hProcess, &code);
-    return static_cast<long>(code);
-  }
-
- private:
-  PROCESS_INFORMATION pi_{};
-  bool ok_ = false;
-};
 
 class WindowsFailbackSessionTest : public ::testing::Test {
  protected:
@@ -228,7 +199,7 @@ TEST_F(WindowsFailbackSessionTest, DecommissionToSpareThenAgentStartAndStopsById
   ::CloseHandle(agent);
 
   // Stop by name: Close ends every kelp.exe, also one the plug-in never started.
-  OwnProcess stranger(dir_ / "other" / "kelp.exe");
+  sorvik::testing::OwnedProcess stranger(dir_ / "other" / "kelp.exe");
   ASSERT_TRUE(stranger.ok());
   session.shutdown();
   EXPECT_EQ(stranger.exitCode(), 15);

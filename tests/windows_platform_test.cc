@@ -20,6 +20,7 @@
 #include "Sorvik/platform/platform.h"
 #include "Sorvik/platform/windows/win32_errno.h"
 #include "Sorvik/service/state_file.h"
+#include "tests/windows_test_process.h"
 
 namespace {
 
@@ -175,38 +176,18 @@ fs::path besideThisExecutable(const char* name) {
 }
 
 // A running copy of the test child under a chosen file name.
-class Child {
+class Child : public sorvik::testing::OwnedProcess {
  public:
-  Child(const fs::path& dir, const std::string& imageName) {
-    fs::create_directories(dir);
-    image_ = dir / imageName;
-    fs::copy_file(besideThisExecutable(SORVIK_TEST_CHILD), image_, fs::copy_options::overwrite_existing);
-    STARTUPINFOA si{};
-    si.cb = sizeof(si);
-    std::string cmd = "\"" + image_.string() + "\"";
-    ok_ = ::CreateProcessA(nullptr, cmd.data(), nullptr, nullptr, FALSE, 0, nullptr, nullptr, &si, &pi_) != 0;
-    if (ok_) ::CloseHandle(pi_.hThread);
-  }
-  ~Child() {
-    if (!ok_) return;
-    ::TerminateProcess(pi_.hProcess, 99);  // no-op when the test already ended it
-    ::WaitForSingleObject(pi_.hProcess, 10000);
-    ::CloseHandle(pi_.hProcess);
-  }
-  bool ok() const { return ok_; }
-  uint32_t pid() const { return pi_.dwProcessId; }
-  // The exit code once the process has ended within 10 s, else -1.
-  long exitCode() const {
-    if (::WaitForSingleObject(pi_.hProcess, 10000) != WAIT_OBJECT_0) return -1;
-    DWORD code = 0;
-    ::GetExitCodeProcess(pi_.hProcess, &code);
-    return static_cast<long>(code);
-  }
+  Child(const fs::path& dir, const std::string& imageName)
+      : sorvik::testing::OwnedProcess(copyOfTestChild(dir, imageName)) {}
 
  private:
-  fs::path image_;
-  PROCESS_INFORMATION pi_{};
-  bool ok_ = false;
+  static fs::path copyOfTestChild(const fs::path& dir, const std::string& imageName) {
+    fs::create_directories(dir);
+    const fs::path image = dir / imageName;
+    fs::copy_file(besideThisExecutable(SORVIK_TEST_CHILD), image, fs::copy_options::overwrite_existing);
+    return image;
+  }
 };
 
 bool contains(const std::vector<uint32_t>& ids, uint32_t id) {
