@@ -153,59 +153,54 @@ void UpdateService::emitSpareResetStatus(int32_t status) {
   sendStatus(doc);
 }
 
-void emitFailbackReport(UpdateService& service, uint32_t port) {
+namespace {
+
+// Reports keep their last stamp in Time and Milliseconds; a Time of 0 means
+// "never stamped", so a real stamp is never 0.
+TimeStamp nonZeroStamp() {
+  TimeStamp now = stampTime();
+  if (now.seconds == 0) now = stampTime();
+  return now;
+}
+
+template <typename Report>
+void restamp(Report& report, TimeStamp now, bool onlyIfNeverStamped) {
+  if (onlyIfNeverStamped && report.Time != 0) return;
+  report.Time = now.seconds;
+  report.Milliseconds = now.milliseconds;
+}
+
+void emitFailbackReport(UpdateService& service, bool onlyIfNeverStamped, const uint32_t* port) {
+  const TimeStamp now = nonZeroStamp();
   FailbackReportRecord report;
   {
-    // A Time of 0 means "never stamped"; never store it as a real stamp.
-    TimeStamp now = stampTime();
-    if (now.seconds == 0) now = stampTime();
     MutexLock lock(&service.stateMutex);
-    service.FailbackReport.Time = now.seconds;
-    service.FailbackReport.Milliseconds = now.milliseconds;
-    service.FailbackReport.Port = port;
+    restamp(service.FailbackReport, now, onlyIfNeverStamped);
+    if (port != nullptr) service.FailbackReport.Port = *port;
     report = service.FailbackReport;
   }
   service.emitFailbackStatus(report.FailbackStatus, TimeStamp{report.Time, report.Milliseconds}, report.Port);
 }
 
-void emitFailbackReportUnchanged(UpdateService& service) {
-  FailbackReportRecord report;
-  {
-    const TimeStamp now = stampTime();
-    MutexLock lock(&service.stateMutex);
-    if (service.FailbackReport.Time == 0) {
-      service.FailbackReport.Time = now.seconds;
-      service.FailbackReport.Milliseconds = now.milliseconds;
-    }
-    report = service.FailbackReport;
-  }
-  service.emitFailbackStatus(report.FailbackStatus, TimeStamp{report.Time, report.Milliseconds}, report.Port);
-}
-
-void emitFailoverReportRestamped(UpdateService& service) {
+void emitFailoverReport(UpdateService& service, bool onlyIfNeverStamped) {
+  const TimeStamp now = nonZeroStamp();
   FailoverReportRecord report;
   {
-    const TimeStamp now = stampTime();
     MutexLock lock(&service.stateMutex);
-    service.FailoverReport.Time = now.seconds;
-    service.FailoverReport.Milliseconds = now.milliseconds;
+    restamp(service.FailoverReport, now, onlyIfNeverStamped);
     report = service.FailoverReport;
   }
   service.emitFailoverStatus(report.FailoverState, TimeStamp{report.Time, report.Milliseconds});
 }
 
-void emitFailoverReportUnchanged(UpdateService& service) {
-  FailoverReportRecord report;
-  {
-    const TimeStamp now = stampTime();
-    MutexLock lock(&service.stateMutex);
-    if (service.FailoverReport.Time == 0) {
-      service.FailoverReport.Time = now.seconds;
-      service.FailoverReport.Milliseconds = now.milliseconds;
-    }
-    report = service.FailoverReport;
-  }
-  service.emitFailoverStatus(report.FailoverState, TimeStamp{report.Time, report.Milliseconds});
-}
+}  // namespace
+
+void emitFailbackReport(UpdateService& service, uint32_t port) { emitFailbackReport(service, false, &port); }
+
+void emitFailbackReportUnchanged(UpdateService& service) { emitFailbackReport(service, true, nullptr); }
+
+void emitFailoverReportRestamped(UpdateService& service) { emitFailoverReport(service, false); }
+
+void emitFailoverReportUnchanged(UpdateService& service) { emitFailoverReport(service, true); }
 
 }  // namespace sorvik
