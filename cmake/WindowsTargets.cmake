@@ -52,14 +52,6 @@ if(SORVIK_BUILD_TESTS)
   set(_posix_only_cases
     # nm on a shared object; sorvik_dll_exports checks the DLL.
     ExportsTest.ExactlyTheSixEntryPointsAreExported
-    # expect errno 2 for a missing directory; Windows reports error 3.
-    StateFileTest.UncreatableFileReportsCreateError
-    # expect "/" between directory and bundle name; Windows joins with "\\".
-    DownloadTest.FetchesWithCurlAndReportsEachProgressPiece
-    JoinBundlePathTest.AddsASeparatorOnlyWhenMissing
-    # expects the download directory as "C:/...\\downloads"; it is resolved
-    # to the native form "C:\\...\\downloads".
-    WorkerTest.StartUpReportsEverythingInOrder
     # need a symbolic link that Boost resolves; Wine's links are not
     # reparse points, and Windows needs a privilege to make one.
     DownloadDirTest.ProtectsRootsTheCurrentDirectoryAndItsAncestors)

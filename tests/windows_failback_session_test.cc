@@ -172,6 +172,9 @@ TEST_F(WindowsFailbackSessionTest, DecommissionToSpareThenAgentStartAndStopsById
   ASSERT_NE(waitFor("^Failover started\\.$"), "");
   ASSERT_TRUE(session.restart(&error)) << error;
   ASSERT_NE(waitFor("FailoverState=\"105\""), "") << "the restarted plug-in is not a reserve spare";
+  // Commands are ignored until the restarted worker has left the pending
+  // decommission behind; its last start-up report says it has.
+  ASSERT_NE(waitFor("SpareResetStatus"), "");
   ASSERT_TRUE(session.sendConfiguration(drives));
 
   // Start: kelp.exe gets the token on its input and answers on its port.

@@ -86,7 +86,8 @@ TEST_F(WorkerTest, StartUpReportsEverythingInOrder) {
   testing::WorkerThread worker(service);
   ASSERT_TRUE(wait_.waitUntilSleeping(service, 1));
 
-  const std::string downloads = (cwd_.path() / "downloads").string();
+  // The directory as the platform writes it (native separators).
+  const std::string downloads = (cwd_.path() / "downloads").make_preferred().string();
   EXPECT_TRUE(boost::filesystem::is_directory(downloads));
   EXPECT_EQ(service.downloadDir(), downloads);
   EXPECT_EQ(readFile("update.xml"),

@@ -4,6 +4,7 @@
 
 #include <boost/filesystem.hpp>
 
+#include "Sorvik/platform/platform.h"
 #include "Sorvik/update/update_test_env.h"
 
 namespace sorvik {
@@ -25,8 +26,9 @@ TEST_F(DownloadDirTest, ProtectsRootsTheCurrentDirectoryAndItsAncestors) {
 }
 
 TEST(JoinBundlePathTest, AddsASeparatorOnlyWhenMissing) {
-  EXPECT_EQ(joinBundlePath("d", "f.zip"), "d/f.zip");
-  EXPECT_EQ(joinBundlePath("d/", "f.zip"), "d/f.zip");
+  const std::string sep = platform::pathSeparator();
+  EXPECT_EQ(joinBundlePath("d", "f.zip"), "d" + sep + "f.zip");
+  EXPECT_EQ(joinBundlePath("d" + sep, "f.zip"), "d" + sep + "f.zip");
 }
 
 }  // namespace

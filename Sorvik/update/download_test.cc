@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "Sorvik/platform/platform.h"
 #include "Sorvik/plugin/status_codes.h"
 #include "Sorvik/update/curl_command.h"
 #include "Sorvik/update/update_test_env.h"
@@ -50,7 +51,7 @@ TEST_F(DownloadTest, FetchesWithCurlAndReportsEachProgressPiece) {
   std::string bundlePath;
   ASSERT_TRUE(DownloadBundle(service(), "http://h:8080/d/f.zip?x=1", bundlePath));
 
-  EXPECT_EQ(bundlePath, (dir() / "downloads").string() + "/f.zip?x=1");
+  EXPECT_EQ(bundlePath, (dir() / "downloads").string() + platform::pathSeparator() + "f.zip?x=1");
   EXPECT_TRUE(fs::is_empty(dir() / "downloads"));
   EXPECT_TRUE(fs::is_directory(dir() / "data"));
   const auto starts = host().starts();
