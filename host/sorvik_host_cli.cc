@@ -71,6 +71,18 @@ int parseOptions(int argc, char** argv, const char* usage, Options* options, boo
   return kExitOk;
 }
 
+SessionOptions sessionOptionsFor(const Options& options, const std::string& library, const std::string& workingDir,
+                                 unsigned long hostPid) {
+  SessionOptions session;
+  session.libraryPath = library;
+  session.logThreshold = options.logLevel;
+  session.runner.workingDir = workingDir;
+  session.runner.ps1Interpreter = options.ps1Interpreter;
+  session.runner.inheritOutput = options.inheritChildOutput;
+  session.runner.extraEnvironment.push_back("SORVIK_HOST_PID=" + std::to_string(hostPid));
+  return session;
+}
+
 int runInstructions(ScriptRunner& runner, Display& display, const std::function<bool(std::string*)>& nextLine,
                     bool interactive, const std::string& where) {
   int lineNumber = 0;

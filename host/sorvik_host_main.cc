@@ -98,13 +98,7 @@ int run(const Options& options) {
 
   Display display(stdout, isTerminal(1));
   EventLog events;
-  SessionOptions sessionOptions;
-  sessionOptions.libraryPath = library;
-  sessionOptions.logThreshold = options.logLevel;
-  sessionOptions.runner.workingDir = absolute(".");
-  sessionOptions.runner.ps1Interpreter = options.ps1Interpreter;
-  sessionOptions.runner.inheritOutput = options.inheritChildOutput;
-  sessionOptions.runner.extraEnvironment.push_back("SORVIK_HOST_PID=" + std::to_string(::getpid()));
+  const SessionOptions sessionOptions = sessionOptionsFor(options, library, absolute("."), static_cast<unsigned long>(::getpid()));
   HostSession session(sessionOptions, [&](Event event) {
     display.show(event);
     events.add(std::move(event));
@@ -134,8 +128,7 @@ int run(const Options& options) {
 
   const bool interactive = options.script.empty() && isTerminal(0);
   if (interactive) display.say("sorvik-host ready; type help for the instructions.");
-  ScriptRunner runner(&session, &events, &display,
-                      std::chrono::milliseconds(static_cast<int64_t>(options.waitSeconds * 1000)));
+  ScriptRunner runner(&session, &events, &display, waitLimit(options));
   LineReader reader(scriptFd, stopInput.fd());
   const int exitCode = runInstructions(
       runner, display,

@@ -119,13 +119,7 @@ int run(const Options& options) {
 
   Display display(stdout, _isatty(_fileno(stdout)) != 0);
   EventLog events;
-  SessionOptions sessionOptions;
-  sessionOptions.libraryPath = library;
-  sessionOptions.logThreshold = options.logLevel;
-  sessionOptions.runner.workingDir = absolute(".");
-  sessionOptions.runner.ps1Interpreter = options.ps1Interpreter;
-  sessionOptions.runner.inheritOutput = options.inheritChildOutput;
-  sessionOptions.runner.extraEnvironment.push_back("SORVIK_HOST_PID=" + std::to_string(::GetCurrentProcessId()));
+  const SessionOptions sessionOptions = sessionOptionsFor(options, library, absolute("."), ::GetCurrentProcessId());
   HostSession session(sessionOptions, [&](Event event) {
     display.show(event);
     events.add(std::move(event));
@@ -160,8 +154,7 @@ int run(const Options& options) {
 
   const bool interactive = options.script.empty() && _isatty(_fileno(stdin)) != 0;
   if (interactive) display.say("sorvik-host ready; type help for the instructions.");
-  ScriptRunner runner(&session, &events, &display,
-                      std::chrono::milliseconds(static_cast<int64_t>(options.waitSeconds * 1000)));
+  ScriptRunner runner(&session, &events, &display, waitLimit(options));
   std::istream& input = options.script.empty() ? std::cin : scriptFile;
   const int exitCode = runInstructions(
       runner, display,
